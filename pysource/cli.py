@@ -1,0 +1,133 @@
+"""Command line: analyse Python files and folders one logical line at a time.
+
+    python2.7 -m pysource.cli [--lang 2.7|3.5|3.6] [--split-only] PATH...
+
+Each PATH is a .py file or a folder searched recursively for .py files. For
+every logical line the output gives its first line number, kind and text, and
+what the analyzer recorded: names defined, type equivalences, argument names,
+base classes, or the syntax error. With --split-only, or when the analyzer
+module is not built, it prints the logical lines with their kinds and tokens.
+"""
+
+from __future__ import print_function
+
+import argparse
+import os
+import sys
+
+from pysource import utils
+
+kKindNames = {0: 'stmt', 1: 'class', 2: 'def', 11: 'try', 21: 'comment', 22: 'blank'}
+
+# Language version -> (version triple, grammar file, is a Python 3 grammar).
+kLanguages = {
+    '2.7': ((2, 7, 0), 'Python-Grammar-2.7', False),
+    '3.5': ((3, 5, 0), 'Python-Grammar-3.5', True),
+    '3.6': ((3, 6, 0), 'Python-Grammar-3.6', True),
+}
+
+
+def IterSourceFiles(paths):
+    """Yields the .py files named by paths, folders searched in sorted order."""
+    for path in paths:
+        if os.path.isdir(path):
+            for dirpath, dirnames, filenames in os.walk(path):
+                dirnames.sort()
+                for name in sorted(filenames):
+                    if name.endswith('.py'):
+                        yield os.path.join(dirpath, name)
+        else:
+            yield path
+
+
+def InAsyncDef(logical):
+    """True when the nearest enclosing def of a logical is an async def."""
+    scope = logical.fParentScope
+    while scope is not None:
+        if scope.fKind == 2:
+            return scope.fTokenCount > 0 and scope.GetTokenString(0) == b'async'
+        if scope.fKind == 1:
+            return False
+        scope = scope.fParentScope
+    return False
+
+
+def _Text(logical):
+    return logical.fLineText.rstrip(b'\r\n').decode('utf-8', 'replace')
+
+
+def _Show(values):
+    out = []
+    for v in values:
+        if isinstance(v, tuple):
+            out.append('%s=%s' % tuple(x.decode('utf-8', 'replace') if isinstance(x, bytes)
+                                       else repr(x) for x in v))
+        else:
+            out.append(v.decode('utf-8', 'replace') if isinstance(v, bytes) else repr(v))
+    return ', '.join(out)
+
+
+def PrintSplit(logical, out):
+    print('%5d  %-7s %s' % (logical.fFirstLine + 1, kKindNames.get(logical.fKind, logical.fKind),
+                            _Text(logical).split('\n')[0]), file=out)
+    if logical.fTokenCount:
+        print('       tokens: %s' % ' '.join(repr(t) for t, _ in logical.fTokens), file=out)
+
+
+def PrintAnalysis(logical, error, out):
+    PrintSplit(logical, out)
+    if error is not None:
+        print('       error: %s (line %s, column %s)' % (error.msg, error.lineno, error.offset),
+              file=out)
+        return
+    for label, attr in (('defines', 'fNamesDefined'), ('equivs', 'fTypeEquivs'),
+                        ('args', 'fArgNames'), ('arg equivs', 'fArgTypeEquivs'),
+                        ('bases', 'fBaseClassNames')):
+        values = getattr(logical, attr)
+        if values:
+            print('       %s: %s' % (label, _Show(values)), file=out)
+
+
+def MakeAnalyzer(lang):
+    """The analyzer for a language version, or None when the module is not built."""
+    try:
+        from pysource import treelens
+    except ImportError:
+        return None
+    triple, grammar, py3 = kLanguages[lang]
+    return treelens.CPGenAnalyzerImpl(triple, grammar, None, py3, grammar)
+
+
+def Main(argv=None):
+    parser = argparse.ArgumentParser(description=__doc__.split('\n\n')[0])
+    parser.add_argument('paths', nargs='+', metavar='PATH')
+    parser.add_argument('--lang', choices=sorted(kLanguages), default='2.7',
+                        help='language version of the sources (default 2.7)')
+    parser.add_argument('--split-only', action='store_true',
+                        help='only split into logical lines and tokens')
+    args = parser.parse_args(argv)
+    analyzer = None if args.split_only else MakeAnalyzer(args.lang)
+    out = sys.stdout
+    status = 0
+    for path in IterSourceFiles(args.paths):
+        try:
+            with open(path, 'rb') as f:
+                text = f.read()
+        except (IOError, OSError) as e:
+            print('%s: cannot read: %s' % (path, e), file=sys.stderr)
+            status = 1
+            continue
+        print('== %s' % path, file=out)
+        for logical in utils.GetLogicalsFromText(text):
+            if analyzer is None:
+                PrintSplit(logical, out)
+            elif logical.fKind == 22:
+                continue
+            else:
+                PrintAnalysis(logical, analyzer.AnalyzeSingleLogical(logical, InAsyncDef(logical)),
+                              out)
+    return status
+
+
+if __name__ == '__main__':
+    sys.exit(Main())
