@@ -27,6 +27,28 @@ struct NodeConverterObject {
   ConvertFunc NativeConvert; ///< NULL: the Python-level convert is called
 };
 
+/// Direct entry points of a Parser for native drivers, published as the
+/// capsule "pysource.optpgen._C_API". Each does what the Python method of the
+/// same name does, with no argument tuple or method lookup per call. All
+/// object arguments are borrowed.
+struct ParserApi {
+  int Version;
+  PyTypeObject *ParserType;
+  PyTypeObject *NodeConverterType;
+  PyObject *ParseError; ///< the ParseError exception type
+  /// Parser.setup(start): 0, or -1 with an exception set.
+  int (*Setup)(PyObject *Parser, int Start);
+  /// Parser.addtoken(type, value, context): 1 when the input is complete, 0
+  /// when more is expected, -1 with an exception set (ParseError for input
+  /// the grammar rejects).
+  int (*AddToken)(PyObject *Parser, int Type, PyObject *Value, PyObject *Context);
+  /// Parser.getrootnode(): new reference, or NULL with an exception set.
+  PyObject *(*GetRootNode)(PyObject *Parser);
+};
+
+constexpr int kParserApiVersion = 1;
+constexpr const char *kParserCapsuleName = "pysource.optpgen._C_API";
+
 } // namespace optpgen
 
 #endif
