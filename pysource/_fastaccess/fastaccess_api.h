@@ -24,6 +24,7 @@ enum : uint8_t { kFlagInspected = 1 };
 
 /// A logical-line record. Invariant: Texts[0..TokenCount) are byte strings
 /// (owned), Types[i] == token type code of Texts[i], Positions[i] its position.
+/// The one contextual type: a backslash that does not end its line is 201.
 struct LogicalLineObject {
   PyObject_HEAD
   PyObject **Texts;        ///< owned byte strings, TokenCount of them
@@ -62,6 +63,8 @@ struct Api {
   int (*AppendTypeEquiv)(PyObject *Logical, PyObject *Name, PyObject *Info);
   /// New reference: list of token texts of Text (no NEWLINE/INDENT/DEDENT).
   PyObject *(*Tokenize)(const char *Text, Py_ssize_t Len);
+  /// New reference: list of the logical-line records of Text, parents linked.
+  PyObject *(*SplitLogicals)(const char *Text, Py_ssize_t Len);
 };
 
 constexpr int kApiVersion = 1;

@@ -1,0 +1,452 @@
+// The logical-line record type CLogicalLine and the operations on its derived info.
+#include "pysource/_fastaccess/internal.h"
+#include "pysource/_fastaccess/records.h"
+
+#include "typedesc.h"
+
+#include <stddef.h>
+#include <structmember.h>
+
+namespace fastaccess {
+
+using tl::Ref;
+using tl::guard;
+using tl::raise;
+using tl::raiseFormat;
+using tl::require;
+
+PyTypeObject LogicalLineType = {PyVarObject_HEAD_INIT(nullptr, 0)};
+
+namespace {
+
+LogicalLineObject *self(PyObject *O) { return reinterpret_cast<LogicalLineObject *>(O); }
+
+/// Drops the token arrays (the texts are owned).
+void freeTokens(LogicalLineObject *L) {
+  for (Py_ssize_t I = 0; I < L->TokenCount; ++I)
+    Py_XDECREF(L->Texts[I]);
+  PyMem_Free(L->Texts);
+  L->Texts = nullptr;
+  L->Positions = nullptr;
+  L->Types = nullptr;
+  L->TokenCount = 0;
+  Py_CLEAR(L->TokensView);
+}
+
+/// The list in *Slot, created empty on first use (borrowed).
+PyObject *derivedList(PyObject **Slot) {
+  if (!*Slot)
+    *Slot = require(PyList_New(0)).release();
+  return *Slot;
+}
+
+void appendTo(PyObject **Slot, PyObject *Item) {
+  tl::requireStatus(PyList_Append(derivedList(Slot), Item));
+}
+
+void appendPair(PyObject **Slot, PyObject *Name, PyObject *Info) {
+  Ref Pair = require(PyTuple_Pack(2, Name, Info));
+  appendTo(Slot, Pair.get());
+}
+
+Py_ssize_t checkIndex(LogicalLineObject *L, PyObject *Index) {
+  Py_ssize_t I = PyNumber_AsSsize_t(Index, PyExc_IndexError);
+  if (I == -1 && PyErr_Occurred())
+    throw tl::PyErrSet();
+  if (I < 0 || I >= L->TokenCount)
+    raise(PyExc_IndexError, msg::Index);
+  return I;
+}
+
+long firstLineIndent(PyObject *LineText) {
+  size_t After;
+  return tokcore::indentColumn(PyString_AS_STRING(LineText),
+                               static_cast<size_t>(PyString_GET_SIZE(LineText)), 0, &After);
+}
+
+int32_t positionPart(PyObject *O) {
+  long V = PyInt_AsLong(O);
+  if (V == -1 && PyErr_Occurred())
+    throw tl::PyErrSet();
+  if (V < INT32_MIN || V > INT32_MAX)
+    raise(PyExc_OverflowError, msg::Position);
+  return static_cast<int32_t>(V);
+}
+
+// ---- slots
+
+int logical_traverse(PyObject *O, visitproc visit, void *arg) {
+  LogicalLineObject *L = self(O);
+  Py_VISIT(L->ParentScope);
+  Py_VISIT(L->LocalScopeDefined);
+  Py_VISIT(L->NamesDefined);
+  Py_VISIT(L->TypeEquivs);
+  Py_VISIT(L->ArgNames);
+  Py_VISIT(L->ArgTypeEquivs);
+  Py_VISIT(L->BaseClassNames);
+  Py_VISIT(L->TokensView);
+  Py_VISIT(L->Dict);
+  return 0;
+}
+
+int logical_clear(PyObject *O) {
+  LogicalLineObject *L = self(O);
+  Py_CLEAR(L->ParentScope);
+  Py_CLEAR(L->LocalScopeDefined);
+  Py_CLEAR(L->NamesDefined);
+  Py_CLEAR(L->TypeEquivs);
+  Py_CLEAR(L->ArgNames);
+  Py_CLEAR(L->ArgTypeEquivs);
+  Py_CLEAR(L->BaseClassNames);
+  Py_CLEAR(L->TokensView);
+  Py_CLEAR(L->Dict);
+  return 0;
+}
+
+void logical_dealloc(PyObject *O) {
+  LogicalLineObject *L = self(O);
+  PyObject_GC_UnTrack(O);
+  // Parent chains can be long; the trashcan bounds the C stack.
+  Py_TRASHCAN_SAFE_BEGIN(O)
+  if (L->WeakRefs)
+    PyObject_ClearWeakRefs(O);
+  logical_clear(O);
+  freeTokens(L);
+  Py_CLEAR(L->LineText);
+  Py_TYPE(O)->tp_free(O);
+  Py_TRASHCAN_SAFE_END(O)
+}
+
+// CLogicalLine(tokens, kind=0, first_line=0, line_text=b"")
+int logical_init(PyObject *O, PyObject *Args, PyObject *Kwds) {
+  return guard(-1, [&] {
+    static const char *Names[] = {"tokens", "kind", "first_line", "line_text", nullptr};
+    PyObject *Tokens;
+    int Kind = 0;
+    long FirstLine = 0;
+    PyObject *LineText = nullptr;
+    if (!PyArg_ParseTupleAndKeywords(Args, Kwds, "O|ilS:CLogicalLine",
+                                     const_cast<char **>(Names), &Tokens, &Kind, &FirstLine,
+                                     &LineText))
+      return -1;
+    Ref Seq = Ref::steal(PySequence_Fast(Tokens, msg::Tokens));
+    if (!Seq)
+      return -1;
+    Ref Text = LineText ? Ref::borrow(LineText) : require(PyString_FromString(""));
+    Py_ssize_t N = PySequence_Fast_GET_SIZE(Seq.get());
+    TokenArrays A(N);
+    for (Py_ssize_t I = 0; I < N; ++I) {
+      PyObject *Item = PySequence_Fast_GET_ITEM(Seq.get(), I);
+      if (!PyTuple_Check(Item) || PyTuple_GET_SIZE(Item) != 2)
+        raise(PyExc_TypeError, msg::Tokens);
+      PyObject *Str = PyTuple_GET_ITEM(Item, 0);
+      PyObject *Pos = PyTuple_GET_ITEM(Item, 1);
+      if (!PyString_Check(Str))
+        raiseFormat(PyExc_TypeError, msg::TokenText, Py_TYPE(Str)->tp_name);
+      if (!PyTuple_Check(Pos) || PyTuple_GET_SIZE(Pos) != 2)
+        raise(PyExc_TypeError, msg::Tokens);
+      TokenPos P{positionPart(PyTuple_GET_ITEM(Pos, 0)), positionPart(PyTuple_GET_ITEM(Pos, 1))};
+      A.set(I, Ref::borrow(Str), P,
+            static_cast<uint8_t>(tokcore::classifyText(
+                PyString_AS_STRING(Str), static_cast<size_t>(PyString_GET_SIZE(Str)))));
+    }
+    LogicalLineObject *L = self(O);
+    freeTokens(L);
+    A.moveInto(L);
+    L->Kind = Kind;
+    L->FirstLine = FirstLine;
+    L->Indent = firstLineIndent(Text.get());
+    Py_XSETREF(L->LineText, Text.release());
+    return 0;
+  });
+}
+
+PyObject *logical_repr(PyObject *O) {
+  LogicalLineObject *L = self(O);
+  return PyString_FromFormat("<%s kind=%d line=%ld tokens=%zd>", Py_TYPE(O)->tp_name,
+                             static_cast<int>(L->Kind), L->FirstLine, L->TokenCount);
+}
+
+// ---- attributes
+
+PyObject *get_tokens(PyObject *O, void *) {
+  return guard<PyObject *>(nullptr, [&] {
+    LogicalLineObject *L = self(O);
+    if (!L->TokensView) {
+      Ref View = require(PyTuple_New(L->TokenCount));
+      for (Py_ssize_t I = 0; I < L->TokenCount; ++I) {
+        PyObject *Text = L->Texts[I] ? L->Texts[I] : Py_None;
+        Ref Pair = require(Py_BuildValue("O(ii)", Text, static_cast<int>(L->Positions[I].Row),
+                                         static_cast<int>(L->Positions[I].Col)));
+        PyTuple_SET_ITEM(View.get(), I, Pair.release());
+      }
+      L->TokensView = View.release();
+    }
+    return Ref::borrow(L->TokensView).release();
+  });
+}
+
+PyObject *get_token_count(PyObject *O, void *) { return PyInt_FromSsize_t(self(O)->TokenCount); }
+PyObject *get_kind(PyObject *O, void *) { return PyInt_FromLong(self(O)->Kind); }
+PyObject *get_first_line(PyObject *O, void *) { return PyInt_FromLong(self(O)->FirstLine); }
+PyObject *get_indent(PyObject *O, void *) { return PyInt_FromLong(self(O)->Indent); }
+
+PyObject *get_line_text(PyObject *O, void *) {
+  PyObject *T = self(O)->LineText;
+  if (!T)
+    return PyString_FromString("");
+  Py_INCREF(T);
+  return T;
+}
+
+PyObject *get_inspected(PyObject *O, void *) {
+  return PyBool_FromLong(self(O)->Flags & kFlagInspected);
+}
+
+int set_inspected(PyObject *O, PyObject *V, void *) {
+  if (!V) {
+    PyErr_SetString(PyExc_TypeError, msg::NoDelete);
+    return -1;
+  }
+  int On = PyObject_IsTrue(V);
+  if (On < 0)
+    return -1;
+  LogicalLineObject *L = self(O);
+  L->Flags = On ? (L->Flags | kFlagInspected) : (L->Flags & ~kFlagInspected);
+  return 0;
+}
+
+PyObject *optional(PyObject *V) {
+  if (!V)
+    V = Py_None;
+  Py_INCREF(V);
+  return V;
+}
+
+PyObject *get_parent_scope(PyObject *O, void *) { return optional(self(O)->ParentScope); }
+
+int set_parent_scope(PyObject *O, PyObject *V, void *) {
+  if (V == Py_None)
+    V = nullptr;
+  if (V && !PyObject_TypeCheck(V, &LogicalLineType)) {
+    PyErr_SetString(PyExc_TypeError, msg::ParentScope);
+    return -1;
+  }
+  Py_XINCREF(V);
+  Py_XSETREF(self(O)->ParentScope, V);
+  return 0;
+}
+
+PyObject *get_local_scope(PyObject *O, void *) { return optional(self(O)->LocalScopeDefined); }
+
+int set_local_scope(PyObject *O, PyObject *V, void *) {
+  if (V == Py_None)
+    V = nullptr;
+  Py_XINCREF(V);
+  Py_XSETREF(self(O)->LocalScopeDefined, V);
+  return 0;
+}
+
+template <PyObject *LogicalLineObject::*Field> PyObject *get_list(PyObject *O, void *) {
+  return guard<PyObject *>(nullptr, [&] {
+    return Ref::borrow(derivedList(&(self(O)->*Field))).release();
+  });
+}
+
+// ---- methods
+
+PyObject *m_get_token_string(PyObject *O, PyObject *Index) {
+  return guard<PyObject *>(nullptr, [&] {
+    LogicalLineObject *L = self(O);
+    PyObject *T = L->Texts[checkIndex(L, Index)];
+    return Ref::borrow(T ? T : Py_None).release();
+  });
+}
+
+PyObject *m_append_type_equiv(PyObject *O, PyObject *Args) {
+  PyObject *Name, *Info;
+  if (!PyArg_ParseTuple(Args, "OO:AppendTypeEquiv", &Name, &Info))
+    return nullptr;
+  if (appendTypeEquiv(O, Name, Info) < 0)
+    return nullptr;
+  Py_RETURN_NONE;
+}
+
+PyObject *m_append_arg_type_equiv(PyObject *O, PyObject *Args) {
+  return guard<PyObject *>(nullptr, [&]() -> PyObject * {
+    PyObject *Name, *Info;
+    if (!PyArg_ParseTuple(Args, "OO:AppendArgTypeEquiv", &Name, &Info))
+      return nullptr;
+    expectBytes(Name);
+    expectBytes(Info);
+    appendPair(&self(O)->ArgTypeEquivs, Name, Info);
+    Py_RETURN_NONE;
+  });
+}
+
+template <PyObject *LogicalLineObject::*Field> PyObject *m_append_bytes(PyObject *O, PyObject *V) {
+  return guard<PyObject *>(nullptr, [&]() -> PyObject * {
+    expectBytes(V);
+    appendTo(&(self(O)->*Field), V);
+    Py_RETURN_NONE;
+  });
+}
+
+PyMethodDef Methods[] = {
+    {"GetTokenString", m_get_token_string, METH_O,
+     "GetTokenString(i) -> bytes: the text of token i."},
+    {"AppendTypeEquiv", m_append_type_equiv, METH_VARARGS,
+     "AppendTypeEquiv(name, info): appends (name, info) to fTypeEquivs."},
+    {"AppendArgName", m_append_bytes<&LogicalLineObject::ArgNames>, METH_O,
+     "AppendArgName(name): appends to fArgNames."},
+    {"AppendArgTypeEquiv", m_append_arg_type_equiv, METH_VARARGS,
+     "AppendArgTypeEquiv(name, info): appends (name, info) to fArgTypeEquivs."},
+    {"AppendBaseClassName", m_append_bytes<&LogicalLineObject::BaseClassNames>, METH_O,
+     "AppendBaseClassName(text): appends to fBaseClassNames."},
+    {"AppendNameDefined", m_append_bytes<&LogicalLineObject::NamesDefined>, METH_O,
+     "AppendNameDefined(name): appends to fNamesDefined."},
+    {nullptr, nullptr, 0, nullptr}};
+
+#define TL_GET(Name, Fn, Doc) {const_cast<char *>(Name), Fn, nullptr, const_cast<char *>(Doc), nullptr}
+#define TL_GETSET(Name, Get, Set, Doc)                                                            \
+  {const_cast<char *>(Name), Get, Set, const_cast<char *>(Doc), nullptr}
+
+PyGetSetDef GetSets[] = {
+    TL_GET("fTokens", get_tokens, "tuple of (text, (row, col)) pairs, built on first use"),
+    TL_GET("fTokenCount", get_token_count, "number of tokens"),
+    TL_GET("fKind", get_kind, "0 statement, 1 class, 2 def, 11 try, 21 comment, 22 blank"),
+    TL_GETSET("fInspected", get_inspected, set_inspected, "set once the analyzer has seen it"),
+    TL_GETSET("fParentScope", get_parent_scope, set_parent_scope,
+              "the enclosing def/class logical, or None"),
+    TL_GETSET("fLocalScopeDefined", get_local_scope, set_local_scope,
+              "cached name of the scope this logical defines, or None"),
+    TL_GET("fFirstLine", get_first_line, "0-based line number of the first physical line"),
+    TL_GET("fLineText", get_line_text, "the physical lines of the logical, line ends included"),
+    TL_GET("fIndent", get_indent, "indentation column of the first line"),
+    TL_GET("fNamesDefined", get_list<&LogicalLineObject::NamesDefined>, "names defined"),
+    TL_GET("fTypeEquivs", get_list<&LogicalLineObject::TypeEquivs>, "(name, info) pairs"),
+    TL_GET("fArgNames", get_list<&LogicalLineObject::ArgNames>, "argument names by position"),
+    TL_GET("fArgTypeEquivs", get_list<&LogicalLineObject::ArgTypeEquivs>,
+           "(name, info) pairs of arguments"),
+    TL_GET("fBaseClassNames", get_list<&LogicalLineObject::BaseClassNames>, "base class texts"),
+    {nullptr, nullptr, nullptr, nullptr, nullptr}};
+
+} // namespace
+
+// ---- shared operations
+
+LogicalLineObject *asLogical(PyObject *Obj) {
+  if (!Obj || !PyObject_TypeCheck(Obj, &LogicalLineType))
+    raise(PyExc_TypeError, msg::NotLogical);
+  return self(Obj);
+}
+
+void expectBytes(PyObject *Obj) { tl::expectType(PyString_Check(Obj), msg::Bytes, Obj); }
+
+int clearDerivedInfo(PyObject *Logical) {
+  return guard(-1, [&] {
+    LogicalLineObject *L = asLogical(Logical);
+    PyObject *Lists[] = {L->NamesDefined, L->TypeEquivs, L->ArgNames, L->ArgTypeEquivs,
+                         L->BaseClassNames};
+    for (PyObject *List : Lists)
+      if (List && PyList_GET_SIZE(List))
+        tl::requireStatus(PyList_SetSlice(List, 0, PyList_GET_SIZE(List), nullptr));
+    return 0;
+  });
+}
+
+// A bare name goes to fNamesDefined; a (name, info) pair puts the name there
+// and the whole pair in fTypeEquivs, so an imported name carries what it is.
+int appendAttrib(PyObject *Logical, PyObject *Attrib) {
+  return guard(-1, [&] {
+    LogicalLineObject *L = asLogical(Logical);
+    if (PyString_Check(Attrib)) {
+      appendTo(&L->NamesDefined, Attrib);
+      return 0;
+    }
+    if (!PyTuple_Check(Attrib) || PyTuple_GET_SIZE(Attrib) != 2 ||
+        !PyString_Check(PyTuple_GET_ITEM(Attrib, 0)))
+      raiseFormat(PyExc_TypeError, msg::Attrib, Py_TYPE(Attrib)->tp_name);
+    PyObject *Name = PyTuple_GET_ITEM(Attrib, 0);
+    PyObject *Info = PyTuple_GET_ITEM(Attrib, 1);
+    expectBytes(Info);
+    appendTo(&L->NamesDefined, Name);
+    appendTo(&L->TypeEquivs, Attrib);
+    return 0;
+  });
+}
+
+int appendTypeEquiv(PyObject *Logical, PyObject *Name, PyObject *Info) {
+  return guard(-1, [&] {
+    LogicalLineObject *L = asLogical(Logical);
+    expectBytes(Name);
+    expectBytes(Info);
+    appendPair(&L->TypeEquivs, Name, Info);
+    return 0;
+  });
+}
+
+// ---- TokenArrays
+
+TokenArrays::TokenArrays(Py_ssize_t N) : Count(N) {
+  if (N == 0)
+    return;
+  size_t Bytes = static_cast<size_t>(N) * (sizeof(PyObject *) + sizeof(TokenPos) + 1);
+  Block = static_cast<PyObject **>(PyMem_Malloc(Bytes));
+  if (!Block)
+    throw std::bad_alloc();
+  for (Py_ssize_t I = 0; I < N; ++I)
+    Block[I] = nullptr;
+}
+
+TokenArrays::~TokenArrays() {
+  for (Py_ssize_t I = 0; Block && I < Count; ++I)
+    Py_XDECREF(Block[I]);
+  PyMem_Free(Block);
+}
+
+void TokenArrays::moveInto(LogicalLineObject *L) {
+  L->Texts = Block;
+  L->Positions = positions();
+  L->Types = types();
+  L->TokenCount = Count;
+  Block = nullptr;
+  Count = 0;
+}
+
+LogicalLineObject *newLogical(TokenArrays &A, int Kind, long FirstLine, long Indent,
+                              Ref LineText) {
+  PyObject *O = LogicalLineType.tp_alloc(&LogicalLineType, 0);
+  if (!O)
+    throw tl::PyErrSet();
+  LogicalLineObject *L = self(O);
+  A.moveInto(L);
+  L->Kind = Kind;
+  L->FirstLine = FirstLine;
+  L->Indent = Indent;
+  L->LineText = LineText.release();
+  return L;
+}
+
+int initLogicalLineType() {
+  tl::TypeDesc D;
+  D.Name = "pysource._fastaccess.CLogicalLine";
+  D.Doc = "CLogicalLine(tokens, kind=0, first_line=0, line_text=b'')\n\n"
+          "A logical line: its tokens as (text, (row, col)) pairs, row 0 being the\n"
+          "logical's first physical line and col a byte offset in that line.";
+  D.Size = sizeof(LogicalLineObject);
+  D.Flags = Py_TPFLAGS_DEFAULT | Py_TPFLAGS_BASETYPE;
+  D.Methods = Methods;
+  D.GetSets = GetSets;
+  D.Dealloc = logical_dealloc;
+  D.Traverse = logical_traverse;
+  D.Clear = logical_clear;
+  D.Init = logical_init;
+  D.New = PyType_GenericNew;
+  D.Repr = logical_repr;
+  D.WeakListOffset = offsetof(LogicalLineObject, WeakRefs);
+  LogicalLineType.tp_dictoffset = offsetof(LogicalLineObject, Dict);
+  return tl::readyType(LogicalLineType, D);
+}
+
+} // namespace fastaccess

@@ -1,0 +1,173 @@
+// Module pysource._fastaccess: record operations, tokenizer functions and the native API capsule.
+#include "pysource/_fastaccess/internal.h"
+
+#include "typedesc.h"
+
+namespace fastaccess {
+
+using tl::guard;
+using tl::Ref;
+using tl::require;
+
+namespace {
+
+/// Data of a bytes argument.
+void bytesArg(PyObject *O, const char **Text, Py_ssize_t *Len) {
+  expectBytes(O);
+  *Text = PyString_AS_STRING(O);
+  *Len = PyString_GET_SIZE(O);
+}
+
+PyObject *noneOr(int Status) {
+  if (Status < 0)
+    return nullptr;
+  Py_RETURN_NONE;
+}
+
+PyObject *f_clear(PyObject *, PyObject *Logical) { return noneOr(clearDerivedInfo(Logical)); }
+
+PyObject *f_append_attrib(PyObject *, PyObject *Args) {
+  PyObject *Logical, *Attrib;
+  if (!PyArg_ParseTuple(Args, "OO:AppendLogicalAttrib", &Logical, &Attrib))
+    return nullptr;
+  return noneOr(appendAttrib(Logical, Attrib));
+}
+
+PyObject *f_append_type_equiv(PyObject *, PyObject *Args) {
+  PyObject *Logical, *Name, *Info;
+  if (!PyArg_ParseTuple(Args, "OOO:AppendLogicalTypeEquiv", &Logical, &Name, &Info))
+    return nullptr;
+  return noneOr(appendTypeEquiv(Logical, Name, Info));
+}
+
+PyObject *f_logical_token_type(PyObject *, PyObject *Args) {
+  return guard<PyObject *>(nullptr, [&]() -> PyObject * {
+    PyObject *Logical;
+    Py_ssize_t I;
+    if (!PyArg_ParseTuple(Args, "On:GetLogicalTokenType", &Logical, &I))
+      return nullptr;
+    LogicalLineObject *L = asLogical(Logical);
+    if (I < 0 || I >= L->TokenCount)
+      tl::raise(PyExc_IndexError, msg::Index);
+    return PyInt_FromLong(L->Types[I]);
+  });
+}
+
+PyObject *f_token_type(PyObject *, PyObject *Text) {
+  return guard<PyObject *>(nullptr, [&] {
+    const char *Buf;
+    Py_ssize_t Len;
+    bytesArg(Text, &Buf, &Len);
+    return PyInt_FromLong(tokenTypeOfText(Buf, Len));
+  });
+}
+
+PyObject *f_tokenize(PyObject *, PyObject *Text) {
+  return guard<PyObject *>(nullptr, [&] {
+    const char *Buf;
+    Py_ssize_t Len;
+    bytesArg(Text, &Buf, &Len);
+    return tokenizeText(Buf, Len);
+  });
+}
+
+PyObject *f_split(PyObject *, PyObject *Text) {
+  return guard<PyObject *>(nullptr, [&] {
+    const char *Buf;
+    Py_ssize_t Len;
+    bytesArg(Text, &Buf, &Len);
+    return splitText(Buf, Len);
+  });
+}
+
+PyObject *f_find_string_end(PyObject *, PyObject *Args) {
+  return guard<PyObject *>(nullptr, [&]() -> PyObject * {
+    PyObject *Text;
+    Py_ssize_t Pos;
+    if (!PyArg_ParseTuple(Args, "On:_FindStringEndNonNested", &Text, &Pos))
+      return nullptr;
+    const char *Buf;
+    Py_ssize_t Len;
+    bytesArg(Text, &Buf, &Len);
+    if (Pos >= 0 && Pos < Len) {
+      Py_ssize_t Quote = Pos;
+      while (Quote < Len && Quote - Pos < 2 && Buf[Quote] != '\'' && Buf[Quote] != '"')
+        ++Quote;
+      if (Quote < Len && (Buf[Quote] == '\'' || Buf[Quote] == '"') &&
+          (Quote == Pos || tokcore::isStringPrefix(Buf + Pos, static_cast<size_t>(Quote - Pos))))
+        return PyInt_FromSsize_t(static_cast<Py_ssize_t>(
+            tokcore::findStringEnd(Buf, static_cast<size_t>(Len), static_cast<size_t>(Quote))));
+    }
+    tl::raiseFormat(PyExc_ValueError, msg::NoString, Pos);
+  });
+}
+
+PyMethodDef Functions[] = {
+    {"ClearLogicalDerivedInfo", f_clear, METH_O,
+     "ClearLogicalDerivedInfo(logical): empties the derived-info lists."},
+    {"AppendLogicalAttrib", f_append_attrib, METH_VARARGS,
+     "AppendLogicalAttrib(logical, attrib): attrib is a name, appended to fNamesDefined,\n"
+     "or a (name, info) pair: the name goes to fNamesDefined and the pair to fTypeEquivs."},
+    {"AppendLogicalTypeEquiv", f_append_type_equiv, METH_VARARGS,
+     "AppendLogicalTypeEquiv(logical, name, info): appends (name, info) to fTypeEquivs."},
+    {"GetLogicalTokenType", f_logical_token_type, METH_VARARGS,
+     "GetLogicalTokenType(logical, i) -> int: the type code of token i."},
+    {"GetTokenType", f_token_type, METH_O,
+     "GetTokenType(text) -> int: the type code of the token that text begins with."},
+    {"Tokenize", f_tokenize, METH_O,
+     "Tokenize(text) -> list of token texts, comments and backslashes included."},
+    {"_FindStringEndNonNested", f_find_string_end, METH_VARARGS,
+     "_FindStringEndNonNested(text, pos) -> int\n\n"
+     "The offset just past the string literal that starts at pos (its prefix or\n"
+     "opening quote), or len(text) when it is unterminated. Quotes inside f-string\n"
+     "replacement fields do not nest. ValueError when no literal starts at pos."},
+    {"_SplitLogicals", f_split, METH_O,
+     "_SplitLogicals(text) -> list of CLogicalLine, parents linked."},
+    {nullptr, nullptr, 0, nullptr}};
+
+/// The capsule's table; filled once at import.
+Api TheApi;
+
+int addTypes(PyObject *M) {
+  if (initLogicalLineType() < 0 || initBytesTokenizerType() < 0 || initLoggerType() < 0)
+    return -1;
+  if (tl::addType(M, "CLogicalLine", LogicalLineType) < 0 ||
+      tl::addType(M, "LogicalLineType", LogicalLineType) < 0 ||
+      tl::addType(M, "CBytesTokenizer", BytesTokenizerType) < 0 ||
+      tl::addType(M, "CLogger", LoggerType) < 0)
+    return -1;
+  return 0;
+}
+
+void init(PyObject *M) {
+  if (initTokenTextCache() < 0 || addTypes(M) < 0)
+    throw tl::PyErrSet();
+  Ref Time = require(PyImport_ImportModule("time"));
+  Ref TimeFunc = require(PyObject_GetAttrString(Time.get(), "time"));
+  tl::requireStatus(PyModule_AddObject(M, "__TimeFunc", TimeFunc.release()));
+  TheApi.Version = kApiVersion;
+  TheApi.LogicalLineType = &LogicalLineType;
+  TheApi.TokenTypeOfText = tokenTypeOfText;
+  TheApi.ClearDerivedInfo = clearDerivedInfo;
+  TheApi.AppendAttrib = appendAttrib;
+  TheApi.AppendTypeEquiv = appendTypeEquiv;
+  TheApi.Tokenize = tokenizeText;
+  TheApi.SplitLogicals = splitText;
+  Ref Capsule = require(PyCapsule_New(&TheApi, kCapsuleName, nullptr));
+  tl::requireStatus(PyModule_AddObject(M, "_C_API", Capsule.release()));
+}
+
+} // namespace
+
+} // namespace fastaccess
+
+extern "C" __attribute__((visibility("default"))) void init_fastaccess() {
+  PyObject *M = Py_InitModule3("_fastaccess", fastaccess::Functions,
+                               "Logical-line records and the byte tokenizer of the host.");
+  if (!M)
+    return;
+  tl::guard(0, [&] {
+    fastaccess::init(M);
+    return 0;
+  });
+}
