@@ -1,0 +1,185 @@
+// Validation and compilation of pgen grammars into flat tables.
+#include "grammar.h"
+
+#include <cstring>
+
+namespace pgen {
+
+namespace {
+
+/// Symbol numbers above this are refused, to bound the symbol index table.
+constexpr long MaxSymbol = FirstSymbol + (1 << 20);
+/// Labels, states and arcs are counted in 32 bits with room to spare.
+constexpr size_t MaxCount = 1u << 30;
+
+uint32_t hashText(const char *Text, size_t Len) {
+  uint32_t H = 2166136261u;
+  for (size_t I = 0; I < Len; ++I)
+    H = (H ^ static_cast<unsigned char>(Text[I])) * 16777619u;
+  return H;
+}
+
+std::string describe(const char *What, long N) {
+  return std::string(What) + " " + std::to_string(N);
+}
+
+} // namespace
+
+std::unique_ptr<Grammar> Grammar::compile(const GrammarSource &Src,
+                                          std::string &Error) {
+  std::unique_ptr<Grammar> G(new Grammar());
+  size_t NumLabels = Src.Labels.size();
+  if (NumLabels == 0 || NumLabels > MaxCount) {
+    Error = "grammar has no labels";
+    return nullptr;
+  }
+  G->LabelCount = NumLabels;
+
+  // Symbol number -> DFA index.
+  long MaxSym = FirstSymbol - 1;
+  for (const auto &D : Src.Dfas) {
+    if (D.Symbol < FirstSymbol || D.Symbol > MaxSymbol) {
+      Error = describe("symbol number out of range:", D.Symbol);
+      return nullptr;
+    }
+    if (D.Symbol > MaxSym)
+      MaxSym = D.Symbol;
+  }
+  G->SymbolDfas.assign(static_cast<size_t>(MaxSym - FirstSymbol + 1), -1);
+  for (size_t I = 0; I < Src.Dfas.size(); ++I) {
+    int32_t &Slot = G->SymbolDfas[Src.Dfas[I].Symbol - FirstSymbol];
+    if (Slot != -1) {
+      Error = describe("duplicate symbol", Src.Dfas[I].Symbol);
+      return nullptr;
+    }
+    Slot = static_cast<int32_t>(I);
+  }
+
+  for (size_t L = 0; L < NumLabels; ++L) {
+    int T = Src.Labels[L];
+    if (T < 0 || (T >= FirstSymbol && G->dfaOfSymbol(T) < 0)) {
+      Error = describe("label has an unknown type:", static_cast<long>(L));
+      return nullptr;
+    }
+  }
+  auto tokenLabel = [&](int L) {
+    return L >= 0 && static_cast<size_t>(L) < NumLabels &&
+           Src.Labels[L] < FirstSymbol;
+  };
+
+  size_t Words = (NumLabels + 63) / 64;
+  for (const auto &D : Src.Dfas) {
+    if (D.States.empty()) {
+      Error = describe("symbol has no states:", D.Symbol);
+      return nullptr;
+    }
+    Dfa Out;
+    Out.Symbol = D.Symbol;
+    Out.FirstState = static_cast<uint32_t>(G->States.size());
+    Out.NumStates = static_cast<uint32_t>(D.States.size());
+    Out.FirstSet = static_cast<uint32_t>(G->FirstBits.size());
+    G->FirstBits.resize(G->FirstBits.size() + Words, 0);
+    for (int L : D.First) {
+      if (L < 0 || static_cast<size_t>(L) >= NumLabels) {
+        Error = describe("first set label out of range in symbol", D.Symbol);
+        return nullptr;
+      }
+      G->FirstBits[Out.FirstSet + (L >> 6)] |= uint64_t(1) << (L & 63);
+    }
+    for (size_t S = 0; S < D.States.size(); ++S) {
+      const auto &InArcs = D.States[S];
+      State St;
+      St.FirstArc = static_cast<uint32_t>(G->Arcs.size());
+      St.NumArcs = static_cast<uint32_t>(InArcs.size());
+      St.CanAccept = false;
+      for (const auto &A : InArcs) {
+        if (A.Label < 0 || static_cast<size_t>(A.Label) >= NumLabels ||
+            A.Next < 0 || static_cast<size_t>(A.Next) >= D.States.size()) {
+          Error = describe("arc out of range in symbol", D.Symbol);
+          return nullptr;
+        }
+        int T = Src.Labels[A.Label];
+        Arc Out2;
+        Out2.Label = static_cast<uint32_t>(A.Label);
+        Out2.Next = Out.FirstState + static_cast<uint32_t>(A.Next);
+        Out2.Push = T >= FirstSymbol ? G->dfaOfSymbol(T) : -1;
+        G->Arcs.push_back(Out2);
+        if (A.Label == 0 && static_cast<size_t>(A.Next) == S)
+          St.CanAccept = true;
+      }
+      St.AcceptOnly = InArcs.size() == 1 && St.CanAccept;
+      G->States.push_back(St);
+    }
+    if (G->States.size() > MaxCount || G->Arcs.size() > MaxCount) {
+      Error = "grammar is too large";
+      return nullptr;
+    }
+    G->Dfas.push_back(Out);
+  }
+
+  for (int &T : G->TokenLabels)
+    T = -1;
+  for (const auto &T : Src.Tokens) {
+    if (T.first < 0 || T.first >= 256) {
+      Error = describe("token type out of range:", T.first);
+      return nullptr;
+    }
+    if (!tokenLabel(T.second)) {
+      Error = describe("token has no token label:", T.first);
+      return nullptr;
+    }
+    G->TokenLabels[T.first] = T.second;
+  }
+
+  if (!Src.Keywords.empty()) {
+    size_t Cap = 8;
+    while (Cap < Src.Keywords.size() * 2)
+      Cap *= 2;
+    G->KeywordSlots.assign(Cap, KeywordSlot{0, -1, 0, 0});
+    for (const auto &K : Src.Keywords) {
+      if (!tokenLabel(K.second)) {
+        Error = "keyword has no token label: " + K.first;
+        return nullptr;
+      }
+      uint32_t H = hashText(K.first.data(), K.first.size());
+      size_t I = H & (Cap - 1);
+      while (G->KeywordSlots[I].Label >= 0) {
+        const KeywordSlot &Old = G->KeywordSlots[I];
+        if (Old.Hash == H && Old.Len == K.first.size() &&
+            G->KeywordText.compare(Old.Offset, Old.Len, K.first) == 0)
+          break; // a repeated keyword: the later entry wins, as in a dict
+        I = (I + 1) & (Cap - 1);
+      }
+      KeywordSlot &Slot = G->KeywordSlots[I];
+      if (Slot.Label < 0) {
+        Slot.Hash = H;
+        Slot.Offset = static_cast<uint32_t>(G->KeywordText.size());
+        Slot.Len = static_cast<uint32_t>(K.first.size());
+        G->KeywordText += K.first;
+      }
+      Slot.Label = K.second;
+    }
+  }
+
+  if (G->dfaOfSymbol(Src.Start) < 0) {
+    Error = describe("start symbol has no DFA:", Src.Start);
+    return nullptr;
+  }
+  G->Start = Src.Start;
+  return G;
+}
+
+int Grammar::keywordLabel(const char *Text, size_t Len) const {
+  uint32_t H = hashText(Text, Len);
+  size_t Mask = KeywordSlots.size() - 1;
+  for (size_t I = H & Mask;; I = (I + 1) & Mask) {
+    const KeywordSlot &S = KeywordSlots[I];
+    if (S.Label < 0)
+      return -1;
+    if (S.Hash == H && S.Len == Len &&
+        std::memcmp(KeywordText.data() + S.Offset, Text, Len) == 0)
+      return S.Label;
+  }
+}
+
+} // namespace pgen

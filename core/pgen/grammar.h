@@ -1,0 +1,123 @@
+// Compiled LL(1) tables of a pgen grammar: flat arcs, first sets as bit sets
+// and a hashed keyword table.
+#ifndef TREELENS_PGEN_GRAMMAR_H
+#define TREELENS_PGEN_GRAMMAR_H
+
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace pgen {
+
+/// Token type of identifiers and keywords; keywords are looked up only for it.
+constexpr int NameTokenType = 1;
+/// Symbols (nonterminals) are numbered from here.
+constexpr int FirstSymbol = 256;
+
+/// A grammar in the notation of a pgen grammar object, as plain data.
+///
+/// Labels are numbered by their position and given by their type: < 256 a
+/// token or keyword, >= 256 a symbol. An arc with label 0 back to its own
+/// state marks an accepting state.
+struct GrammarSource {
+  struct Arc {
+    int Label = 0;
+    int Next = 0;
+  };
+  struct Dfa {
+    int Symbol = 0;
+    std::vector<std::vector<Arc>> States;
+    std::vector<int> First; ///< labels that can start the symbol
+  };
+  std::vector<int> Labels; ///< label -> type
+  std::vector<Dfa> Dfas;
+  std::vector<std::pair<std::string, int>> Keywords; ///< text -> label
+  std::vector<std::pair<int, int>> Tokens;           ///< token type -> label
+  int Start = 0;
+};
+
+/// Immutable parse tables compiled from a GrammarSource; shared by parsers.
+class Grammar {
+public:
+  /// One transition. Push is the DFA index of a symbol label, else -1.
+  struct Arc {
+    uint32_t Label;
+    uint32_t Next; ///< global state index
+    int32_t Push;
+  };
+  /// Arcs of state S are Arcs[FirstArc, FirstArc + NumArcs), in grammar order.
+  struct State {
+    uint32_t FirstArc;
+    uint32_t NumArcs;
+    bool AcceptOnly; ///< the only arc is (0, this state)
+    bool CanAccept;  ///< some arc is (0, this state)
+  };
+  /// States of a DFA are global indexes [FirstState, FirstState + NumStates).
+  struct Dfa {
+    int Symbol;
+    uint32_t FirstState;
+    uint32_t NumStates;
+    uint32_t FirstSet; ///< offset of its first set in FirstBits
+  };
+
+  /// Validates and compiles Source; null with a message in Error on failure.
+  static std::unique_ptr<Grammar> compile(const GrammarSource &Source,
+                                          std::string &Error);
+
+  /// Label of a token, or -1 when the grammar has none for it.
+  int classify(int Type, const char *Text, size_t Len) const {
+    if (Type == NameTokenType && Text && !KeywordSlots.empty()) {
+      int L = keywordLabel(Text, Len);
+      if (L >= 0)
+        return L;
+    }
+    if (Type < 0 || Type >= 256)
+      return -1;
+    return TokenLabels[Type];
+  }
+
+  /// DFA index of a symbol number, or -1.
+  int dfaOfSymbol(int Symbol) const {
+    size_t I = static_cast<size_t>(Symbol) - FirstSymbol;
+    return Symbol >= FirstSymbol && I < SymbolDfas.size() ? SymbolDfas[I] : -1;
+  }
+
+  /// True when label L starts DFA D.
+  bool inFirst(const Dfa &D, uint32_t L) const {
+    return (FirstBits[D.FirstSet + (L >> 6)] >> (L & 63)) & 1;
+  }
+
+  int startSymbol() const { return Start; }
+  size_t labelCount() const { return LabelCount; }
+  const Dfa &dfa(size_t I) const { return Dfas[I]; }
+  const State &state(size_t I) const { return States[I]; }
+  const Arc &arc(size_t I) const { return Arcs[I]; }
+
+private:
+  Grammar() = default;
+  int keywordLabel(const char *Text, size_t Len) const;
+
+  struct KeywordSlot {
+    uint32_t Hash;
+    int32_t Label; ///< -1: empty slot
+    uint32_t Offset, Len; ///< text in KeywordText
+  };
+
+  std::vector<Arc> Arcs;
+  std::vector<State> States;
+  std::vector<Dfa> Dfas;
+  std::vector<uint64_t> FirstBits;
+  std::vector<int32_t> SymbolDfas; ///< symbol - 256 -> DFA index or -1
+  int32_t TokenLabels[256];
+  std::vector<KeywordSlot> KeywordSlots; ///< open addressing, power of 2
+  std::string KeywordText;
+  size_t LabelCount = 0;
+  int Start = 0;
+};
+
+} // namespace pgen
+
+#endif

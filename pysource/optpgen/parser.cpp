@@ -1,0 +1,478 @@
+// The Parser type. The engine reports pushes, shifts and pops; this file
+// turns them into converter calls and children lists.
+#include "parser.h"
+
+#include "converter.h"
+#include "messages.h"
+#include "native/common/typedesc.h"
+#include "pgen/parser.h"
+#include "tables.h"
+
+#include <vector>
+
+namespace optpgen {
+
+PyTypeObject ParserType;
+PyObject *ParseErrorType = nullptr;
+
+namespace {
+
+using tl::guard;
+using tl::Ref;
+using tl::require;
+
+/// A nonterminal being built. Owns Context and its children: none (First and
+/// Children null), exactly one (First) or two and more (Children, a list).
+struct NodeFrame {
+  int Type;
+  PyObject *Context;
+  PyObject *First;
+  PyObject *Children;
+};
+
+/// Parser state; the engine's sink.
+class ParserImpl {
+public:
+  ParserImpl(GrammarPtr T, PyObject *G, PyObject *C, bool Promote)
+      : Tables(std::move(T)), Grammar(G), Converter(C), Promote(Promote),
+        Raw(C == nullptr), Driver(*Tables, *this) {
+    Py_INCREF(Grammar);
+    Py_XINCREF(Converter);
+    Frames.reserve(pgen::Parser<ParserImpl>::MaxDepth);
+    Native = Raw ? nullptr : nativeConvertOf(Converter);
+  }
+  ~ParserImpl() { clear(); }
+
+  /// Drops partial trees, the root and the held objects (tp_clear).
+  void clear() {
+    Driver.reset();
+    clearTree();
+    Py_CLEAR(Converter);
+    Py_CLEAR(Grammar);
+  }
+
+  /// Drops partial trees and the root. Releasing them can run Python code,
+  /// so callers hold the busy mark.
+  void clearTree() {
+    while (!Frames.empty()) {
+      NodeFrame F = Frames.back();
+      Frames.pop_back();
+      Py_XDECREF(F.Context);
+      Py_XDECREF(F.First);
+      Py_XDECREF(F.Children);
+    }
+    Py_CLEAR(Root);
+  }
+
+  int traverse(visitproc visit, void *arg) {
+    Py_VISIT(Grammar);
+    Py_VISIT(Converter);
+    Py_VISIT(Root);
+    for (const NodeFrame &F : Frames) {
+      Py_VISIT(F.Context);
+      Py_VISIT(F.First);
+      Py_VISIT(F.Children);
+    }
+    return 0;
+  }
+
+  // Engine sink. The current token is in TypeObj, Type, Value, Context.
+
+  bool push(int Symbol) {
+    Py_INCREF(Context);
+    Frames.push_back(NodeFrame{Symbol, Context, nullptr, nullptr});
+    return true;
+  }
+
+  bool shift() {
+    return adopt(convert(TypeObj, Type, Value, Context, Py_None));
+  }
+
+  bool pop(int Symbol) {
+    NodeFrame F = Frames.back();
+    Frames.pop_back();
+    Ref Ctx = Ref::steal(F.Context);
+    Ref First = Ref::steal(F.First);
+    Ref Kids = Ref::steal(F.Children);
+    if (Promote && First)
+      return adopt(First.release());
+    if (!Kids) {
+      Kids = Ref::steal(PyList_New(First ? 1 : 0));
+      if (!Kids)
+        return false;
+      if (First)
+        PyList_SET_ITEM(Kids.get(), 0, First.release());
+    }
+    Ref SymbolObj;
+    if (!Native) {
+      SymbolObj = Ref::steal(PyInt_FromLong(Symbol));
+      if (!SymbolObj)
+        return false;
+    }
+    return adopt(convert(SymbolObj.get(), Symbol, Py_None, Ctx.get(),
+                         Kids.get()));
+  }
+
+  GrammarPtr Tables;
+  PyObject *Grammar;              ///< owned; null once cleared
+  PyObject *Converter;            ///< owned; null for raw tuples
+  PyObject *Root = nullptr;       ///< owned; the converted start symbol
+  bool Promote;                   ///< one-child nonterminals are not built
+  bool Raw;                       ///< no converter: (type, value, context, children)
+  bool Busy = false;              ///< inside addtoken, setup or a release
+  ConvertFunc Native = nullptr;   ///< set when the converter's slot is used
+  std::vector<NodeFrame> Frames;  ///< parallel to the engine's stack
+  pgen::Parser<ParserImpl> Driver;
+
+  // The token being added; borrowed for the duration of addtoken.
+  PyObject *TypeObj = nullptr;
+  PyObject *Value = nullptr;
+  PyObject *Context = nullptr;
+  int Type = 0;
+
+private:
+  /// New reference to the converted node, Py_None to drop it, null on error.
+  PyObject *convert(PyObject *TypeO, int T, PyObject *V, PyObject *Ctx,
+                    PyObject *Kids) {
+    if (Native)
+      return Native(Converter, Grammar, T, V, Ctx, Kids);
+    if (Raw)
+      return PyTuple_Pack(4, TypeO, V, Ctx, Kids);
+    return PyObject_CallMethodObjArgs(Converter, ConvertName, Grammar, TypeO,
+                                      V, Ctx, Kids, nullptr);
+  }
+
+  /// Adds a converted node (stolen; null: failure) to the innermost
+  /// nonterminal, or makes it the root.
+  bool adopt(PyObject *Node) {
+    if (!Node)
+      return false;
+    if (Node == Py_None) {
+      Py_DECREF(Node);
+      return true;
+    }
+    if (Frames.empty()) {
+      PyObject *Old = Root;
+      Root = Node;
+      Py_XDECREF(Old);
+      return true;
+    }
+    NodeFrame &F = Frames.back();
+    if (F.Children) {
+      int R = PyList_Append(F.Children, Node);
+      Py_DECREF(Node);
+      return R == 0;
+    }
+    if (!F.First) {
+      F.First = Node;
+      return true;
+    }
+    PyObject *List = PyList_New(2);
+    if (!List) {
+      Py_DECREF(Node);
+      return false;
+    }
+    PyList_SET_ITEM(List, 0, F.First);
+    PyList_SET_ITEM(List, 1, Node);
+    F.First = nullptr;
+    F.Children = List;
+    return true;
+  }
+};
+
+struct ParserObject {
+  PyObject_HEAD
+  ParserImpl *Impl;
+  PyObject *WeakRefs;
+};
+
+ParserImpl &impl(PyObject *Self) {
+  return *reinterpret_cast<ParserObject *>(Self)->Impl;
+}
+
+/// Holds the busy mark; refuses re-entry from convert or a finaliser.
+class BusyScope {
+public:
+  explicit BusyScope(ParserImpl &P) : P(P) {
+    if (P.Busy)
+      tl::raise(PyExc_RuntimeError, msg::Busy);
+    P.Busy = true;
+  }
+  ~BusyScope() { P.Busy = false; }
+
+private:
+  ParserImpl &P;
+};
+
+/// Token type of an int object; -1 (no label) for anything else.
+int tokenType(PyObject *O) {
+  long V = -1;
+  if (PyInt_Check(O)) {
+    V = PyInt_AS_LONG(O);
+  } else if (PyLong_Check(O)) {
+    int Overflow = 0;
+    V = PyLong_AsLongAndOverflow(O, &Overflow);
+    if (Overflow)
+      V = -1;
+  }
+  return V >= 0 && V < 256 ? static_cast<int>(V) : -1;
+}
+
+[[noreturn]] void raiseParseError(const char *Msg, PyObject *TypeObj,
+                                  PyObject *Value, PyObject *Context) {
+  Ref M = require(PyString_FromString(Msg));
+  Ref E = require(PyObject_CallFunctionObjArgs(ParseErrorType, M.get(),
+                                               TypeObj, Value, Context,
+                                               nullptr));
+  PyErr_SetObject(ParseErrorType, E.get());
+  throw tl::PyErrSet();
+}
+
+const char *statusMessage(pgen::Status S) {
+  switch (S) {
+  case pgen::Status::BadInput:
+    return msg::BadInput;
+  case pgen::Status::BadToken:
+    return msg::BadToken;
+  case pgen::Status::TooMuchInput:
+    return msg::TooMuchInput;
+  case pgen::Status::TooDeep:
+    return msg::TooDeep;
+  default:
+    return nullptr;
+  }
+}
+
+PyObject *parser_addtoken(PyObject *Self, PyObject *Args, PyObject *Kw) {
+  return guard<PyObject *>(nullptr, [&]() -> PyObject * {
+    PyObject *TypeObj, *Value, *Context;
+    static const char *Names[] = {"type", "value", "context", nullptr};
+    if (!Kw && PyTuple_GET_SIZE(Args) == 3) {
+      TypeObj = PyTuple_GET_ITEM(Args, 0);
+      Value = PyTuple_GET_ITEM(Args, 1);
+      Context = PyTuple_GET_ITEM(Args, 2);
+    } else if (!PyArg_ParseTupleAndKeywords(Args, Kw, "OOO:addtoken",
+                                            const_cast<char **>(Names),
+                                            &TypeObj, &Value, &Context)) {
+      throw tl::PyErrSet();
+    }
+    ParserImpl &P = impl(Self);
+    const char *Text = nullptr;
+    Py_ssize_t Len = 0;
+    Ref Utf8;
+    if (PyString_Check(Value)) {
+      Text = PyString_AS_STRING(Value);
+      Len = PyString_GET_SIZE(Value);
+    } else if (PyUnicode_Check(Value)) {
+      Utf8 = Ref::steal(PyUnicode_AsUTF8String(Value));
+      if (Utf8) {
+        Text = PyString_AS_STRING(Utf8.get());
+        Len = PyString_GET_SIZE(Utf8.get());
+      } else {
+        PyErr_Clear(); // not encodable: no keyword
+      }
+    }
+
+    pgen::Status S;
+    {
+      BusyScope Busy(P);
+      P.TypeObj = TypeObj;
+      P.Type = tokenType(TypeObj);
+      P.Value = Value;
+      P.Context = Context;
+      S = P.Driver.addToken(P.Type, Text, static_cast<size_t>(Len));
+      if (S == pgen::Status::Ok)
+        Py_RETURN_FALSE;
+      if (S == pgen::Status::Done)
+        Py_RETURN_TRUE;
+      if (S == pgen::Status::NotReady)
+        tl::raise(PyExc_RuntimeError, msg::NotReady);
+      // Release the partial trees now; keep a convert error across it.
+      PyObject *ET, *EV, *ETb;
+      PyErr_Fetch(&ET, &EV, &ETb);
+      P.clearTree();
+      PyErr_Restore(ET, EV, ETb);
+    }
+    if (const char *M = statusMessage(S))
+      raiseParseError(M, TypeObj, Value, Context);
+    if (!PyErr_Occurred())
+      PyErr_SetString(PyExc_SystemError, "convert failed without an error");
+    throw tl::PyErrSet();
+  });
+}
+
+PyObject *parser_setup(PyObject *Self, PyObject *Args, PyObject *Kw) {
+  return guard<PyObject *>(nullptr, [&]() -> PyObject * {
+    PyObject *Start = Py_None;
+    static const char *Names[] = {"start", nullptr};
+    if (!PyArg_ParseTupleAndKeywords(Args, Kw, "|O:setup",
+                                     const_cast<char **>(Names), &Start))
+      throw tl::PyErrSet();
+    ParserImpl &P = impl(Self);
+    if (!P.Grammar)
+      tl::raise(PyExc_RuntimeError, msg::NotReady);
+    long Symbol = P.Tables->startSymbol();
+    if (Start != Py_None) {
+      Symbol = PyInt_AsLong(Start);
+      if (Symbol == -1 && PyErr_Occurred())
+        throw tl::PyErrSet();
+    }
+    BusyScope Busy(P);
+    P.clearTree();
+    P.Native = P.Raw ? nullptr : nativeConvertOf(P.Converter);
+    if (Symbol < pgen::FirstSymbol || Symbol > 0x7fffffffL ||
+        !P.Driver.setup(static_cast<int>(Symbol)))
+      tl::raiseFormat(PyExc_ValueError, msg::UnknownStart, Symbol);
+    Py_INCREF(Py_None);
+    P.Frames.push_back(
+        NodeFrame{static_cast<int>(Symbol), Py_None, nullptr, nullptr});
+    Py_RETURN_NONE;
+  });
+}
+
+PyObject *parser_getrootnode(PyObject *Self, PyObject *) {
+  PyObject *Root = impl(Self).Root;
+  if (!Root)
+    Root = Py_None;
+  Py_INCREF(Root);
+  return Root;
+}
+
+PyObject *getObject(PyObject *O) {
+  if (!O)
+    O = Py_None;
+  Py_INCREF(O);
+  return O;
+}
+
+PyObject *parser_get_grammar(PyObject *Self, void *) {
+  return getObject(impl(Self).Grammar);
+}
+PyObject *parser_get_converter(PyObject *Self, void *) {
+  return getObject(impl(Self).Converter);
+}
+PyObject *parser_get_rootnode(PyObject *Self, void *) {
+  return getObject(impl(Self).Root);
+}
+PyObject *parser_get_promote(PyObject *Self, void *) {
+  return PyBool_FromLong(impl(Self).Promote);
+}
+PyObject *parser_get_usesnative(PyObject *Self, void *) {
+  return PyBool_FromLong(impl(Self).Native != nullptr);
+}
+
+PyObject *parser_new(PyTypeObject *Type, PyObject *Args, PyObject *Kw) {
+  return guard<PyObject *>(nullptr, [&] {
+    PyObject *Grammar, *Converter = Py_None, *PromoteObj = Py_False;
+    static const char *Names[] = {"grammar", "converter", "promotesinglechild",
+                                  nullptr};
+    if (!PyArg_ParseTupleAndKeywords(Args, Kw, "O|OO:Parser",
+                                     const_cast<char **>(Names), &Grammar,
+                                     &Converter, &PromoteObj))
+      throw tl::PyErrSet();
+    bool Promote = tl::requireStatus(PyObject_IsTrue(PromoteObj)) != 0;
+    if (Converter == Py_None)
+      Converter = nullptr;
+    else if (!PyObject_TypeCheck(Converter, &NodeConverterType) &&
+             !PyObject_HasAttr(Converter, ConvertName))
+      tl::expectType(false, "a converter", Converter);
+    GrammarPtr Tables = tablesFor(Grammar);
+    Ref Self = require(Type->tp_alloc(Type, 0));
+    auto *O = reinterpret_cast<ParserObject *>(Self.get());
+    O->Impl = new ParserImpl(std::move(Tables), Grammar, Converter, Promote);
+    return Self.release();
+  });
+}
+
+int parser_traverse(PyObject *Self, visitproc Visit, void *Arg) {
+  ParserImpl *P = reinterpret_cast<ParserObject *>(Self)->Impl;
+  return P ? P->traverse(Visit, Arg) : 0;
+}
+
+int parser_clear(PyObject *Self) {
+  if (ParserImpl *P = reinterpret_cast<ParserObject *>(Self)->Impl)
+    P->clear();
+  return 0;
+}
+
+void parser_dealloc(PyObject *Self) {
+  auto *O = reinterpret_cast<ParserObject *>(Self);
+  PyObject_GC_UnTrack(Self);
+  if (O->WeakRefs)
+    PyObject_ClearWeakRefs(Self);
+  delete O->Impl;
+  O->Impl = nullptr;
+  Py_TYPE(Self)->tp_free(Self);
+}
+
+PyMethodDef ParserMethods[] = {
+    {"setup", optpgen::kwMethod(parser_setup),
+     METH_VARARGS | METH_KEYWORDS,
+     "setup(start=None)\n\nStarts a new input at the start symbol (default: "
+     "the grammar's); drops the previous tree."},
+    {"addtoken", optpgen::kwMethod(parser_addtoken),
+     METH_VARARGS | METH_KEYWORDS,
+     "addtoken(type, value, context) -> bool\n\nAdds a token; True when the "
+     "start symbol is complete. Raises ParseError for a token the grammar "
+     "does not accept."},
+    {"getrootnode", parser_getrootnode, METH_NOARGS,
+     "getrootnode() -> the converted start symbol, or None"},
+    {nullptr, nullptr, 0, nullptr}};
+
+PyGetSetDef ParserGetSets[] = {
+    {const_cast<char *>("grammar"), parser_get_grammar, nullptr,
+     const_cast<char *>("the grammar object"), nullptr},
+    {const_cast<char *>("converter"), parser_get_converter, nullptr,
+     const_cast<char *>("the converter, or None for raw tuples"), nullptr},
+    {const_cast<char *>("rootnode"), parser_get_rootnode, nullptr,
+     const_cast<char *>("same as getrootnode()"), nullptr},
+    {const_cast<char *>("promotesinglechild"), parser_get_promote, nullptr,
+     const_cast<char *>("nonterminals with one child are replaced by it"),
+     nullptr},
+    {const_cast<char *>("_usesnative"), parser_get_usesnative, nullptr,
+     const_cast<char *>("the converter's native slot is called directly"),
+     nullptr},
+    {nullptr, nullptr, nullptr, nullptr, nullptr}};
+
+} // namespace
+
+PyObject *createParser(PyObject *, PyObject *Args, PyObject *Kw) {
+  return guard<PyObject *>(nullptr, [&] {
+    PyObject *Grammar, *Converter, *Promote = Py_False;
+    static const char *Names[] = {"grammar", "converter", "promotesinglechild",
+                                  nullptr};
+    if (!PyArg_ParseTupleAndKeywords(Args, Kw, "OO|O:CreateParser",
+                                     const_cast<char **>(Names), &Grammar,
+                                     &Converter, &Promote))
+      throw tl::PyErrSet();
+    Ref CallArgs = require(PyTuple_Pack(3, Grammar, Converter, Promote));
+    return parser_new(&ParserType, CallArgs.get(), nullptr);
+  });
+}
+
+int initParser(PyObject *Module) {
+  tl::TypeDesc D;
+  D.Name = "pysource.optpgen.Parser";
+  D.Doc = "Parser(grammar, converter=None, promotesinglechild=False)\n\n"
+          "LL(1) parser over a pgen grammar object. Call setup(), then "
+          "addtoken() for each token until it returns True, then "
+          "getrootnode(). Without a converter nodes are (type, value, "
+          "context, children) tuples.";
+  D.Size = sizeof(ParserObject);
+  D.Flags = Py_TPFLAGS_DEFAULT;
+  D.Methods = ParserMethods;
+  D.GetSets = ParserGetSets;
+  D.New = parser_new;
+  D.Dealloc = parser_dealloc;
+  D.Traverse = parser_traverse;
+  D.Clear = parser_clear;
+  D.WeakListOffset = offsetof(ParserObject, WeakRefs);
+  if (tl::readyType(ParserType, D) < 0)
+    return -1;
+  if (PyModule_AddIntConstant(Module, "kMaxDepth",
+                              pgen::Parser<ParserImpl>::MaxDepth) < 0)
+    return -1;
+  return tl::addType(Module, "Parser", ParserType);
+}
+
+} // namespace optpgen

@@ -1,0 +1,23 @@
+// The Parser type: drives the native pgen engine and builds the tree through
+// a converter.
+#ifndef TREELENS_OPTPGEN_PARSER_H
+#define TREELENS_OPTPGEN_PARSER_H
+
+#include "native/common/pyref.h"
+
+namespace optpgen {
+
+TL_HIDDEN extern PyTypeObject ParserType;
+/// pysource.optpgen.ParseError (new-style class, set at module init).
+TL_HIDDEN extern PyObject *ParseErrorType;
+
+/// CreateParser(grammar, converter, promotesinglechild=False).
+TL_HIDDEN PyObject *createParser(PyObject *Module, PyObject *Args,
+                                 PyObject *Kw);
+
+/// Readies Parser and adds it to Module; -1 on failure.
+TL_HIDDEN int initParser(PyObject *Module);
+
+} // namespace optpgen
+
+#endif
