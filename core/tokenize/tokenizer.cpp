@@ -24,9 +24,15 @@ inline bool isBlank(unsigned char C) { return C == ' ' || C == '\t' || C == '\f'
 inline bool isLineEnd(unsigned char C) { return C == '\n' || C == '\r'; }
 
 // NUMBER: 0[xX][0-9a-fA-F_]* [lL]? | 0[oObB][0-9_]* [lL]?
-//       | ([0-9][0-9_]* ('.' [0-9_]*)? | '.' [0-9][0-9_]*) ([eE] [+-]? [0-9][0-9_]*)? [jJlL]?
+//       | (D ('.' D?)? | '.' D) ([eE] [+-]? D)? [jJlL]?     with D = [0-9] ('_'? [0-9])*
 size_t scanNumber(const char *Buf, size_t Len, size_t P) {
   auto At = [&](size_t I) -> unsigned char { return I < Len ? Buf[I] : 0; };
+  // An underscore counts only between digits: `1_000`, but `1.__class__`.
+  auto Digits = [&](size_t I) {
+    while (isDigit(At(I)) || (At(I) == '_' && isDigit(At(I + 1))))
+      ++I;
+    return I;
+  };
   if (At(P) == '0') {
     unsigned char X = At(P + 1);
     if (X == 'x' || X == 'X' || X == 'o' || X == 'O' || X == 'b' || X == 'B') {
@@ -39,22 +45,16 @@ size_t scanNumber(const char *Buf, size_t Len, size_t P) {
       return P;
     }
   }
-  while (isDigit(At(P)) || At(P) == '_')
-    ++P;
-  if (At(P) == '.') {
-    ++P;
-    while (isDigit(At(P)) || At(P) == '_')
-      ++P;
-  }
+  P = Digits(P);
+  if (At(P) == '.')
+    P = Digits(P + 1);
   unsigned char E = At(P);
   if (E == 'e' || E == 'E') {
     size_t Q = P + 1;
     if (At(Q) == '+' || At(Q) == '-')
       ++Q;
     if (isDigit(At(Q))) {
-      P = Q;
-      while (isDigit(At(P)) || At(P) == '_')
-        ++P;
+      P = Digits(Q);
     }
   }
   unsigned char S = At(P);
