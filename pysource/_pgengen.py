@@ -25,8 +25,11 @@ class ParserGenerator(_pgen.ParserGenerator):
         if op_text2number is None:
             op_text2number = dict(_grammar.opmap)
         self.tok_number2name = dict(tok_number2name)
-        self.tok_name2number = dict(
-            (name, number) for number, name in tok_number2name.items())
+        # A name given to several numbers (the caller's "RARROW" at 51 beside
+        # the standard one) means the lowest of them.
+        self.tok_name2number = {}
+        for number, name in sorted(tok_number2name.items(), reverse=True):
+            self.tok_name2number[name] = number
         self.op_text2number = dict(op_text2number)
         _pgen.ParserGenerator.__init__(self, filename, stream)
 
