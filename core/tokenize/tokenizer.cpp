@@ -3,25 +3,7 @@
 
 namespace tokcore {
 
-namespace {
-
-inline bool isNameStart(unsigned char C) {
-  return (C >= 'a' && C <= 'z') || (C >= 'A' && C <= 'Z') || C == '_' || C >= 0x80;
-}
-
-inline bool isNameChar(unsigned char C) {
-  return isNameStart(C) || (C >= '0' && C <= '9');
-}
-
-inline bool isDigit(unsigned char C) { return C >= '0' && C <= '9'; }
-
-inline bool isHexDigit(unsigned char C) {
-  return isDigit(C) || (C >= 'a' && C <= 'f') || (C >= 'A' && C <= 'F');
-}
-
-inline bool isBlank(unsigned char C) { return C == ' ' || C == '\t' || C == '\f'; }
-
-inline bool isLineEnd(unsigned char C) { return C == '\n' || C == '\r'; }
+using namespace detail;
 
 // NUMBER: 0[xX][0-9a-fA-F_]* [lL]? | 0[oObB][0-9_]* [lL]?
 //       | (D ('.' D?)? | '.' D) ([eE] [+-]? D)? [jJlL]?     with D = [0-9] ('_'? [0-9])*
@@ -62,8 +44,6 @@ size_t scanNumber(const char *Buf, size_t Len, size_t P) {
     ++P;
   return P;
 }
-
-} // namespace
 
 bool isStringPrefix(const char *Text, size_t Len) {
   auto Lower = [](char C) { return static_cast<char>(C | 0x20); };
@@ -236,87 +216,6 @@ long indentColumn(const char *Buf, size_t Len, size_t Pos, size_t *After) {
   }
   *After = Pos;
   return Col;
-}
-
-void Lexer::skipBlanks() {
-  while (Pos < Len && isBlank(Buf[Pos]))
-    ++Pos;
-}
-
-void Lexer::consumeLineEnd() {
-  if (Pos >= Len)
-    return;
-  if (Buf[Pos] == '\r' && Pos + 1 < Len && Buf[Pos + 1] == '\n')
-    Pos += 2;
-  else
-    Pos += 1;
-  ++Line;
-  LineStart = Pos;
-}
-
-TokenKind Lexer::peek(size_t *End) const {
-  size_t P = Pos;
-  unsigned char C = Buf[P];
-  if (isNameStart(C)) {
-    size_t Q = P + 1;
-    while (Q < Len && isNameChar(Buf[Q]))
-      ++Q;
-    if (Q < Len && (Buf[Q] == '\'' || Buf[Q] == '"') && isStringPrefix(Buf + P, Q - P)) {
-      *End = findStringEnd(Buf, Len, Q);
-      return TokenKind::STRING;
-    }
-    *End = Q;
-    return TokenKind::NAME;
-  }
-  if (isDigit(C) || (C == '.' && P + 1 < Len && isDigit(Buf[P + 1]))) {
-    *End = scanNumber(Buf, Len, P);
-    return TokenKind::NUMBER;
-  }
-  if (C == '\'' || C == '"') {
-    *End = findStringEnd(Buf, Len, P);
-    return TokenKind::STRING;
-  }
-  if (C == '#') {
-    size_t Q = P + 1;
-    while (Q < Len && !isLineEnd(Buf[Q]))
-      ++Q;
-    *End = Q;
-    return TokenKind::COMMENT;
-  }
-  if (C == '\\') {
-    *End = P + 1;
-    // Only a backslash at the end of a line continues it.
-    return P + 1 >= Len || isLineEnd(Buf[P + 1]) ? TokenKind::CONTINUATION
-                                                 : TokenKind::ERRORTOKEN;
-  }
-  TokenKind K;
-  size_t N = matchOperator(Buf + P, Len - P, &K);
-  if (N) {
-    *End = P + N;
-    return K;
-  }
-  *End = P + 1;
-  return TokenKind::ERRORTOKEN;
-}
-
-void Lexer::scan(Token &T) {
-  size_t End;
-  T.Type = peek(&End);
-  T.Start = Pos;
-  T.End = End;
-  T.Line = Line;
-  T.Col = Pos - LineStart;
-  if (T.Type == TokenKind::STRING) {
-    // Count the line ends inside a multi-line literal.
-    for (size_t P = Pos; P < End; ++P) {
-      char C = Buf[P];
-      if (C == '\n' || (C == '\r' && (P + 1 >= Len || Buf[P + 1] != '\n'))) {
-        ++Line;
-        LineStart = P + 1;
-      }
-    }
-  }
-  Pos = End;
 }
 
 } // namespace tokcore

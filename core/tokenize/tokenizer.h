@@ -104,6 +104,29 @@ size_t findStringEnd(const char *Buf, size_t Len, size_t QuotePos);
 /// Length of a UTF-8 byte-order mark at the start of Buf (3 or 0).
 size_t bomLength(const char *Buf, size_t Len);
 
+/// Offset past the number literal starting at P (a digit, or '.' and a digit).
+size_t scanNumber(const char *Buf, size_t Len, size_t P);
+
+namespace detail {
+inline bool isNameStart(unsigned char C) {
+  return (C >= 'a' && C <= 'z') || (C >= 'A' && C <= 'Z') || C == '_' || C >= 0x80;
+}
+
+inline bool isNameChar(unsigned char C) {
+  return isNameStart(C) || (C >= '0' && C <= '9');
+}
+
+inline bool isDigit(unsigned char C) { return C >= '0' && C <= '9'; }
+
+inline bool isHexDigit(unsigned char C) {
+  return isDigit(C) || (C >= 'a' && C <= 'f') || (C >= 'A' && C <= 'F');
+}
+
+inline bool isBlank(unsigned char C) { return C == ' ' || C == '\t' || C == '\f'; }
+
+inline bool isLineEnd(unsigned char C) { return C == '\n' || C == '\r'; }
+} // namespace detail
+
 /// Scans a text token by token, tracking physical lines.
 /// Invariant: Pos <= Len; LineStart <= Pos; Line counts the line ends before LineStart.
 class Lexer {
@@ -137,6 +160,89 @@ public:
 /// next multiple of 8, a form feed resets to 0. *After receives the offset
 /// of the first other byte.
 long indentColumn(const char *Buf, size_t Len, size_t Pos, size_t *After);
+
+// The lexer's per-token steps are inline: they run once per token.
+
+inline void Lexer::skipBlanks() {
+  while (Pos < Len && detail::isBlank(Buf[Pos]))
+    ++Pos;
+}
+
+inline void Lexer::consumeLineEnd() {
+  if (Pos >= Len)
+    return;
+  if (Buf[Pos] == '\r' && Pos + 1 < Len && Buf[Pos + 1] == '\n')
+    Pos += 2;
+  else
+    Pos += 1;
+  ++Line;
+  LineStart = Pos;
+}
+
+inline TokenKind Lexer::peek(size_t *End) const {
+  size_t P = Pos;
+  unsigned char C = Buf[P];
+  if (detail::isNameStart(C)) {
+    size_t Q = P + 1;
+    while (Q < Len && detail::isNameChar(Buf[Q]))
+      ++Q;
+    if (Q < Len && (Buf[Q] == '\'' || Buf[Q] == '"') && isStringPrefix(Buf + P, Q - P)) {
+      *End = findStringEnd(Buf, Len, Q);
+      return TokenKind::STRING;
+    }
+    *End = Q;
+    return TokenKind::NAME;
+  }
+  if (detail::isDigit(C) || (C == '.' && P + 1 < Len && detail::isDigit(Buf[P + 1]))) {
+    *End = scanNumber(Buf, Len, P);
+    return TokenKind::NUMBER;
+  }
+  if (C == '\'' || C == '"') {
+    *End = findStringEnd(Buf, Len, P);
+    return TokenKind::STRING;
+  }
+  if (C == '#') {
+    size_t Q = P + 1;
+    while (Q < Len && !detail::isLineEnd(Buf[Q]))
+      ++Q;
+    *End = Q;
+    return TokenKind::COMMENT;
+  }
+  if (C == '\\') {
+    *End = P + 1;
+    // Only a backslash at the end of a line continues it.
+    return P + 1 >= Len || detail::isLineEnd(Buf[P + 1]) ? TokenKind::CONTINUATION
+                                                 : TokenKind::ERRORTOKEN;
+  }
+  TokenKind K;
+  size_t N = matchOperator(Buf + P, Len - P, &K);
+  if (N) {
+    *End = P + N;
+    return K;
+  }
+  *End = P + 1;
+  return TokenKind::ERRORTOKEN;
+}
+
+inline void Lexer::scan(Token &T) {
+  size_t End;
+  T.Type = peek(&End);
+  T.Start = Pos;
+  T.End = End;
+  T.Line = Line;
+  T.Col = Pos - LineStart;
+  if (T.Type == TokenKind::STRING) {
+    // Count the line ends inside a multi-line literal.
+    for (size_t P = Pos; P < End; ++P) {
+      char C = Buf[P];
+      if (C == '\n' || (C == '\r' && (P + 1 >= Len || Buf[P + 1] != '\n'))) {
+        ++Line;
+        LineStart = P + 1;
+      }
+    }
+  }
+  Pos = End;
+}
 
 } // namespace tokcore
 

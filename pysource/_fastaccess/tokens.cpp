@@ -6,6 +6,7 @@
 #include "typedesc.h"
 
 #include <cstring>
+#include <vector>
 
 namespace fastaccess {
 
@@ -116,9 +117,117 @@ PyObject *tokenizeText(const char *Text, Py_ssize_t Size) {
   });
 }
 
+namespace {
+
+/// Shares one bytes object among equal token texts of one split, so a name
+/// used a hundred times costs one allocation. Open addressing on the text's
+/// hash. Invariant: Used < Slots.size() / 2; every non-null Text is owned.
+class TextInterner {
+public:
+  ~TextInterner() { clear(); }
+
+  /// New reference: the shared text for Text[0..Len).
+  Ref get(const char *Text, size_t Len, TokenKind Kind) {
+    if (Len < 2 || Len > kMaxLen)
+      return tokenText(Text, Len, Kind);
+    if (Used * 2 >= Slots.size())
+      grow();
+    uint64_t H = hash(Text, Len);
+    size_t Mask = Slots.size() - 1;
+    for (size_t I = static_cast<size_t>(H) & Mask;; I = (I + 1) & Mask) {
+      Slot &S = Slots[I];
+      if (!S.Text) {
+        Ref New = tokenText(Text, Len, Kind);
+        S = {H, Ref::borrow(New.get()).release()};
+        ++Used;
+        return New;
+      }
+      if (S.Hash == H && static_cast<size_t>(PyString_GET_SIZE(S.Text)) == Len &&
+          std::memcmp(PyString_AS_STRING(S.Text), Text, Len) == 0)
+        return Ref::borrow(S.Text);
+    }
+  }
+
+  /// Drops the shared texts; keeps a modest table for the next split.
+  void clear() {
+    for (Slot &S : Slots)
+      Py_CLEAR(S.Text);
+    if (Slots.size() > kKeepSlots)
+      std::vector<Slot>().swap(Slots);
+    Used = 0;
+  }
+
+private:
+  static constexpr size_t kMaxLen = 32;
+  static constexpr size_t kKeepSlots = 1 << 14;
+  struct Slot {
+    uint64_t Hash;
+    PyObject *Text;
+  };
+
+  static uint64_t hash(const char *Text, size_t Len) {
+    uint64_t H = 1469598103934665603ull;
+    for (size_t I = 0; I < Len; ++I)
+      H = (H ^ static_cast<unsigned char>(Text[I])) * 1099511628211ull;
+    return H ^ (H >> 29);
+  }
+
+  void grow() {
+    std::vector<Slot> Old;
+    Old.swap(Slots);
+    Slots.assign(Old.empty() ? 1024 : Old.size() * 2, Slot{0, nullptr});
+    size_t Mask = Slots.size() - 1;
+    for (const Slot &S : Old) {
+      if (!S.Text)
+        continue;
+      size_t I = static_cast<size_t>(S.Hash) & Mask;
+      while (Slots[I].Text)
+        I = (I + 1) & Mask;
+      Slots[I] = S;
+    }
+  }
+
+  std::vector<Slot> Slots;
+  size_t Used = 0;
+};
+
+/// Working memory of one split, reused by the next one to spare the allocator.
+struct SplitScratch {
+  tokcore::SplitResult Result;
+  TextInterner Texts;
+  bool InUse = false;
+};
+
+SplitScratch SharedScratch;
+
+/// Claims the shared scratch, or a private one when a split is already
+/// running (a collection can run Python code in the middle of one).
+class ScratchLease {
+public:
+  ScratchLease() : S(SharedScratch.InUse ? &Own : &SharedScratch) { S->InUse = true; }
+  ~ScratchLease() {
+    S->Texts.clear();
+    constexpr size_t kKeepTokens = 1 << 20;
+    if (S->Result.Tokens.capacity() > kKeepTokens) {
+      std::vector<tokcore::SplitToken>().swap(S->Result.Tokens);
+      std::vector<tokcore::SplitLogical>().swap(S->Result.Logicals);
+    }
+    S->InUse = false;
+  }
+  SplitScratch &operator*() { return *S; }
+
+private:
+  SplitScratch Own;
+  SplitScratch *S;
+};
+
+} // namespace
+
 PyObject *splitText(const char *Text, Py_ssize_t Size) {
   return guard<PyObject *>(nullptr, [&] {
-    tokcore::SplitResult R;
+    ScratchLease Lease;
+    tokcore::SplitResult &R = (*Lease).Result;
+    TextInterner &Texts = (*Lease).Texts;
     tokcore::TokStatus Status = tokcore::splitLogicals(Text, static_cast<size_t>(Size), R);
     if (Status != tokcore::TokStatus::OK)
       raiseStatus(Status);
@@ -129,7 +238,7 @@ PyObject *splitText(const char *Text, Py_ssize_t Size) {
       TokenArrays A(static_cast<Py_ssize_t>(G.TokenCount));
       for (size_t J = 0; J < G.TokenCount; ++J) {
         const tokcore::SplitToken &T = R.Tokens[G.FirstToken + J];
-        A.set(static_cast<Py_ssize_t>(J), tokenText(Text + T.Start, T.End - T.Start, T.Type),
+        A.set(static_cast<Py_ssize_t>(J), Texts.get(Text + T.Start, T.End - T.Start, T.Type),
               TokenPos{T.Row, T.Col}, static_cast<uint8_t>(T.Type));
       }
       Ref LineText = require(PyString_FromStringAndSize(
