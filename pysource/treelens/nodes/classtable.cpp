@@ -1,0 +1,117 @@
+// The node class tree: one row per class, with the grammar rules each class represents.
+#include "pysource/treelens/nodes/classtable.h"
+
+namespace treelens {
+
+namespace {
+
+const char *const BinaryExpressionRules[] = {
+    "test: or_test ['if' or_test 'else' test] | lambdef",
+    "or_test: and_test ('or' and_test)*",
+    "and_test: not_test ('and' not_test)*",
+    "not_test: 'not' not_test | comparison",
+    "comparison: expr (comp_op expr)*",
+    "expr: xor_expr ('|' xor_expr)*",
+    "xor_expr: and_expr ('^' and_expr)*",
+    "and_expr: shift_expr ('&' shift_expr)*",
+    "shift_expr: arith_expr (('<<'|'>>') arith_expr)*",
+    "arith_expr: term (('+'|'-') term)*",
+    "term: factor (('*'|'/'|'%'|'//') factor)*",
+    nullptr};
+const char *const StarExpressionRules[] = {"star_expr: '*' expr", nullptr};
+const char *const FunctionParameterDefRules[] = {"fpdef: NAME | '(' fplist ')'", "tfpdef: NAME [':' test]",
+                                                 nullptr};
+const char *const DefiningArglistRules[] = {"fplist: fpdef (',' fpdef)* [',']", nullptr};
+const char *const SingleDecoratorRules[] = {"decorator: '@' dotted_name [ '(' [arglist] ')' ] NEWLINE",
+                                            nullptr};
+const char *const DottedNameRules[] = {"dotted_name: NAME ('.' NAME)*", nullptr};
+const char *const MultipleDecoratorsRules[] = {"decorators: decorator+", nullptr};
+const char *const ExceptClauseRules[] = {"except_clause: 'except' [test [('as' | ',') test]]",
+                                         "except_clause: 'except' [test ['as' NAME]]", nullptr};
+const char *const AnnotatedAssignRules[] = {"annassign: ':' test ['=' test]", nullptr};
+const char *const YieldExprRules[] = {"yield_expr: 'yield' [testlist]", "yield_expr: 'yield' [yield_arg]",
+                                      nullptr};
+const char *const YieldArgRules[] = {"yield_arg: 'from' test | testlist", nullptr};
+const char *const TestListStarExprRules[] = {
+    "exprlist: expr (',' expr)* [',']", "testlist: test (',' test)* [',']",
+    "testlist_star_expr: (test|star_expr) (',' (test|star_expr))* [',']",
+    "testlist_comp: test ( comp_for | (',' test)* [','] )", nullptr};
+const char *const ListmakerRules[] = {"listmaker: test ( list_for | (',' test)* [','] )", nullptr};
+const char *const AtomExprRules[] = {"atom_expr: [AWAIT] atom trailer*", nullptr};
+const char *const PowerRules[] = {"power: atom trailer* ['**' factor]", "power: atom_expr ['**' factor]",
+                                  nullptr};
+
+using C = NodeClass;
+
+#define TL_NODE(Cls, Base, Doc, Rules, Final)                                                      \
+  NodeClassRow { C::Cls, C::Base, #Cls, "pysource.treelens." #Cls, Doc, Rules, Final, nullptr, nullptr }
+
+} // namespace
+
+const std::vector<NodeClassRow> &nodeClassRows() {
+  static const std::vector<NodeClassRow> Rows = {
+      TL_NODE(CNode, CNode,
+              "Base class for parse tree nodes.\n\n"
+              "Subclasses define access methods but store nothing more than the base class. "
+              "Initialisation is done by the node factory setting the attributes directly rather "
+              "than through the constructor, for speed. Nodes are explicitly discarded and kept on "
+              "a free list for reuse.",
+              nullptr, false),
+      TL_NODE(CStmt, CNode, "Base class for statements.", nullptr, false),
+      TL_NODE(CExpression, CNode, "Base class for all expressions", nullptr, false),
+      TL_NODE(CAtom, CExpression, "Bracketed atom or a run of adjacent string literals.", nullptr, false),
+      TL_NODE(CBinaryExpression, CExpression, "Binary, boolean, comparison or conditional expression.",
+              BinaryExpressionRules, false),
+      TL_NODE(CStarExpression, CExpression, "Star expression: '*' expr.", StarExpressionRules, false),
+      TL_NODE(CImportNamesStmt, CNode, "import statement: 'import' dotted names with 'as'.", nullptr, false),
+      TL_NODE(CFromImportStmt, CNode, "from statement: 'from' module 'import' names.", nullptr, false),
+      TL_NODE(CSingleUsedArgumentNode, CNode,
+              "One call argument of more than one token: keyword, star or generator argument.", nullptr,
+              false),
+      TL_NODE(CFunctionParameterDef, CNode, "One parameter with an annotation, or a nested tuple parameter.",
+              FunctionParameterDefRules, false),
+      TL_NODE(CDefiningArglistNode, CNode, "Parameter list of a def or lambda.", DefiningArglistRules, false),
+      TL_NODE(CUsedArglistNode, CNode, "Argument list of a call, decorator or class statement.", nullptr,
+              false),
+      TL_NODE(CParametersNode, CNode, "Parenthesised parameters after def NAME.", nullptr, false),
+      TL_NODE(CClassdefStmt, CStmt, "class statement.", nullptr, false),
+      TL_NODE(CFuncdefStmt, CStmt, "def statement.", nullptr, false),
+      TL_NODE(CSingleDecorator, CNode, "One decorator line.", SingleDecoratorRules, false),
+      TL_NODE(CDottedName, CExpression, "Dotted name: NAME ('.' NAME)*.", DottedNameRules, false),
+      TL_NODE(CMultipleDecorators, CNode, "Two or more decorators.", MultipleDecoratorsRules, false),
+      TL_NODE(CLambdaExpr, CExpression, "lambda expression.", nullptr, false),
+      TL_NODE(CGlobalStmt, CStmt, "global statement.", nullptr, false),
+      TL_NODE(CNonlocalStmt, CStmt, "nonlocal statement.", nullptr, false),
+      TL_NODE(CForStmt, CStmt, "for statement.", nullptr, false),
+      TL_NODE(CWithStmt, CStmt, "with statement.", nullptr, false),
+      TL_NODE(CWithItem, CNode, "with item with 'as': expression 'as' target.", nullptr, false),
+      TL_NODE(CPassStmt, CStmt, "pass statement.", nullptr, false),
+      TL_NODE(CExceptClause, CNode, "except clause.", ExceptClauseRules, false),
+      TL_NODE(CExprStmt, CStmt, "Expression statement: assignments, augmented assignments, annotations.",
+              nullptr, false),
+      TL_NODE(CAnnotatedAssignNode, CNode, "Annotation part of an expression statement.",
+              AnnotatedAssignRules, false),
+      TL_NODE(CBinaryOp, CNode, "Binary operator.", nullptr, false),
+      TL_NODE(CTestExpr, CExpression, "Test expression.", nullptr, false),
+      TL_NODE(CReturnStmt, CStmt, "return statement.", nullptr, false),
+      TL_NODE(CYieldExpr, CExpression, "yield expression.", YieldExprRules, false),
+      TL_NODE(CYieldArg, CNode, "Python 3 yield argument: 'from' test.", YieldArgRules, false),
+      TL_NODE(CTestListStarExpr, CExpression,
+              "Comma-separated expression list, or an expression followed by a comprehension clause.",
+              TestListStarExprRules, false),
+      TL_NODE(CNameLiteral, CExpression, "NAME token.", nullptr, false),
+      TL_NODE(CKeywordLiteral, CExpression, "Keyword token (also the ASYNC and AWAIT tokens).", nullptr,
+              false),
+      TL_NODE(CCompForNode, CNode, "Comprehension 'for' clause.", nullptr, false),
+      TL_NODE(CListmakerNode, CNode, "List display contents of the 2.7 grammar.", ListmakerRules, false),
+      TL_NODE(CTrailer, CNode, "Trailer: call arguments, subscript or attribute.", nullptr, false),
+      TL_NODE(CAtomExpr, CExpression, "atom_expr: [AWAIT] atom trailer*.", AtomExprRules, false),
+      TL_NODE(CPower, CExpression, "power: atom with trailers and an optional exponent.", PowerRules, true),
+      TL_NODE(CNumberLiteral, CExpression, "NUMBER token.", nullptr, false),
+      TL_NODE(CStringLiteral, CExpression, "STRING token.", nullptr, false),
+      TL_NODE(CFactorExpr, CExpression, "Unary '+', '-' or '~' applied to a factor.", nullptr, false),
+  };
+  return Rows;
+}
+
+} // namespace treelens
