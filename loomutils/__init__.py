@@ -1,0 +1,1 @@
+"""Host utilities shared by the analysis modules (reflect: error reporting)."""

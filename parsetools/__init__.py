@@ -1,0 +1,1 @@
+"""Host helpers for parsing: the logical-line record type (logicalline)."""
