@@ -1,0 +1,114 @@
+"""Analysing the 2.7 standard library one logical line at a time: treelens vs CPython's parser.
+
+Both sides run in this process over the same logical lines, split beforehand
+with GetLogicalsFromText. treelens runs CPGenAnalyzerImpl.AnalyzeSingleLogical
+with the 2.7 grammar on every logical line (parse, walk, discard). The peer is
+CPython 2.7's compile(..., ast.PyCF_ONLY_AST) on the source text of the same
+lines, completed the way the analyzer completes them (a block header gets a
+"pass" body, a lone else/elif/except/finally its opening clause, a decorator
+its function). Prints microseconds per logical line for both and their ratio.
+
+Usage: TREELENS_BUILD_DIR=<build> python2.7 bench/treelens_bench.py [repeat] [file_limit]
+"""
+
+import ast
+import gc
+import os
+import sys
+import time
+
+sys.path.insert(0, os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
+
+from tests.py import support  # noqa: E402
+from pysource import treelens  # noqa: E402
+from pysource.utils import GetLogicalsFromText  # noqa: E402
+
+kTryKind = 11
+
+
+def SignificantTokens(logical):
+    return [t for t, _ in logical.fTokens if not t.startswith(b'#') and t != b'\\']
+
+
+def CompletedSource(logical):
+    """The logical's source, dedented and completed as the analyzer completes its tokens."""
+    text = logical.fLineText
+    text = text[len(text) - len(text.lstrip(b' \t\f')):]
+    if not text.endswith(b'\n'):
+        text += b'\n'
+    toks = SignificantTokens(logical)
+    if not toks:
+        return text
+    first, last = toks[0], toks[-1]
+    if first == b'elif':
+        text = text[2:]
+    elif first in (b'except', b'finally'):
+        text = b'try: pass\n' + text
+    elif first == b'else':
+        text = b'if 0: pass\n' + text
+    if logical.fKind == kTryKind:
+        if last == b':':
+            text += b' pass\n'
+        return text + b'finally: pass\n'
+    if first == b'@':
+        return text + b'def function(): pass\n'
+    if last == b':':
+        text += b' pass\n'
+    return text
+
+
+def LoadLogicals(limit):
+    logicals = []
+    for path in support.CorpusFiles('2.7', limit=limit):
+        logicals.extend(GetLogicalsFromText(support.ReadBytes(path)))
+    return logicals
+
+
+def TimeTreelens(analyzer, logicals, repeat):
+    best = None
+    for _ in range(repeat):
+        for logical in logicals:
+            logical.fInspected = False
+        gc.collect()
+        analyze = analyzer.AnalyzeSingleLogical
+        start = time.time()
+        for logical in logicals:
+            analyze(logical, False)
+        elapsed = time.time() - start
+        best = elapsed if best is None else min(best, elapsed)
+    return best
+
+
+def TimeCPython(sources, repeat):
+    best = None
+    flags = ast.PyCF_ONLY_AST
+    for _ in range(repeat):
+        gc.collect()
+        start = time.time()
+        for src in sources:
+            try:
+                compile(src, '<s>', 'exec', flags)
+            except (SyntaxError, ValueError, TypeError):
+                pass
+        elapsed = time.time() - start
+        best = elapsed if best is None else min(best, elapsed)
+    return best
+
+
+def main():
+    repeat = int(sys.argv[1]) if len(sys.argv) > 1 else 3
+    limit = int(sys.argv[2]) if len(sys.argv) > 2 else None
+    logicals = LoadLogicals(limit)
+    sources = [CompletedSource(l) for l in logicals]
+    analyzer = treelens.CPGenAnalyzerImpl((2, 7, 0), treelens.kPy2DefaultGrammar, None, False)
+    n = len(logicals)
+    ours = TimeTreelens(analyzer, logicals, repeat)
+    peer = TimeCPython(sources, repeat)
+    print('logical lines: %d (best of %d runs)' % (n, repeat))
+    print('treelens AnalyzeSingleLogical: %7.3f us/line' % (ours * 1e6 / n))
+    print('CPython compile(PyCF_ONLY_AST): %7.3f us/line' % (peer * 1e6 / n))
+    print('ratio treelens / CPython: %.3f' % (ours / peer))
+
+
+if __name__ == '__main__':
+    main()
