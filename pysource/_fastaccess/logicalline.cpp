@@ -64,6 +64,21 @@ long firstLineIndent(PyObject *LineText) {
                                static_cast<size_t>(PyString_GET_SIZE(LineText)), 0, &After);
 }
 
+/// Items of a 2-tuple or 2-list (borrowed); false for anything else.
+bool pairOf(PyObject *O, PyObject **First, PyObject **Second) {
+  if (PyTuple_Check(O) && PyTuple_GET_SIZE(O) == 2) {
+    *First = PyTuple_GET_ITEM(O, 0);
+    *Second = PyTuple_GET_ITEM(O, 1);
+    return true;
+  }
+  if (PyList_Check(O) && PyList_GET_SIZE(O) == 2) {
+    *First = PyList_GET_ITEM(O, 0);
+    *Second = PyList_GET_ITEM(O, 1);
+    return true;
+  }
+  return false;
+}
+
 int32_t positionPart(PyObject *O) {
   long V = PyInt_AsLong(O);
   if (V == -1 && PyErr_Occurred())
@@ -132,21 +147,25 @@ int logical_init(PyObject *O, PyObject *Args, PyObject *Kwds) {
     Ref Seq = Ref::steal(PySequence_Fast(Tokens, msg::Tokens));
     if (!Seq)
       return -1;
-    Ref Text = LineText ? Ref::borrow(LineText) : require(PyString_FromString(""));
+    if (PyList_Check(Seq.get())) // Python code run below must not resize it
+      Seq = require(PyList_AsTuple(Seq.get()));
+    Ref Line = LineText ? Ref::borrow(LineText) : require(PyString_FromString(""));
     Py_ssize_t N = PySequence_Fast_GET_SIZE(Seq.get());
     TokenArrays A(N);
     for (Py_ssize_t I = 0; I < N; ++I) {
       PyObject *Item = PySequence_Fast_GET_ITEM(Seq.get(), I);
-      if (!PyTuple_Check(Item) || PyTuple_GET_SIZE(Item) != 2)
+      PyObject *Str, *Pos;
+      if (!pairOf(Item, &Str, &Pos))
         raise(PyExc_TypeError, msg::Tokens);
-      PyObject *Str = PyTuple_GET_ITEM(Item, 0);
-      PyObject *Pos = PyTuple_GET_ITEM(Item, 1);
       if (!PyString_Check(Str))
         raiseFormat(PyExc_TypeError, msg::TokenText, Py_TYPE(Str)->tp_name);
-      if (!PyTuple_Check(Pos) || PyTuple_GET_SIZE(Pos) != 2)
+      PyObject *Row, *Col;
+      if (!pairOf(Pos, &Row, &Col))
         raise(PyExc_TypeError, msg::Tokens);
-      TokenPos P{positionPart(PyTuple_GET_ITEM(Pos, 0)), positionPart(PyTuple_GET_ITEM(Pos, 1))};
-      A.set(I, Ref::borrow(Str), P,
+      // Converting the position may run Python code that changes the lists.
+      Ref Text = Ref::borrow(Str), RowRef = Ref::borrow(Row), ColRef = Ref::borrow(Col);
+      TokenPos P{positionPart(RowRef.get()), positionPart(ColRef.get())};
+      A.set(I, std::move(Text), P,
             static_cast<uint8_t>(tokcore::classifyText(
                 PyString_AS_STRING(Str), static_cast<size_t>(PyString_GET_SIZE(Str)))));
     }
@@ -155,8 +174,8 @@ int logical_init(PyObject *O, PyObject *Args, PyObject *Kwds) {
     A.moveInto(L);
     L->Kind = Kind;
     L->FirstLine = FirstLine;
-    L->Indent = firstLineIndent(Text.get());
-    Py_XSETREF(L->LineText, Text.release());
+    L->Indent = firstLineIndent(Line.get());
+    Py_XSETREF(L->LineText, Line.release());
     return 0;
   });
 }

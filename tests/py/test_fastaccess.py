@@ -35,6 +35,8 @@ class RecordTest(unittest.TestCase):
         self.assertEqual((defaults.fTokens, defaults.fKind, defaults.fFirstLine,
                           defaults.fLineText, defaults.fIndent), ((), 0, 0, b'', 0))
         kw = fa.CLogicalLine(tokens=[], kind=1, first_line=3, line_text=b'\tx')
+        lists = fa.CLogicalLine(([b'x', [1, 2]],))
+        self.assertEqual(lists.fTokens, ((b'x', (1, 2)),))
         self.assertEqual((kw.fKind, kw.fFirstLine, kw.fIndent), (1, 3, 8))
 
     def testConstructorErrors(self):
@@ -60,6 +62,18 @@ class RecordTest(unittest.TestCase):
         self.assertEqual(L.fTokens, ((b'def', (0, 0)), (b'f', (0, 4))))
         L.__init__([(b'x', (0, 0))])
         self.assertEqual(L.fTokens, ((b'x', (0, 0)),))
+
+    def testPositionConversionThatMutatesTheInput(self):
+        toks = []
+
+        class Shrinker(object):
+            def __int__(self):
+                del toks[:]
+                return 3
+
+        toks.extend([(b'a', (0, Shrinker())), (b'b', (0, 1))])
+        L = fa.CLogicalLine(toks)
+        self.assertEqual(L.fTokens, ((b'a', (0, 3)), (b'b', (0, 1))))
 
     def testIndexErrors(self):
         L = MakeLogical()
@@ -196,6 +210,36 @@ class ModuleTest(unittest.TestCase):
                      'GetLogicalTokenType', 'GetTokenType', 'Tokenize',
                      '_FindStringEndNonNested', 'CBytesTokenizer', 'CLogger'):
             self.assertTrue(hasattr(fa, name), name)
+
+    def testCapsuleTable(self):
+        import ctypes
+        api = ctypes.pythonapi
+        api.PyCapsule_GetPointer.restype = ctypes.c_void_p
+        api.PyCapsule_GetPointer.argtypes = [ctypes.py_object, ctypes.c_char_p]
+        ptr = api.PyCapsule_GetPointer(fa._C_API, b'pysource._fastaccess._C_API')
+
+        class Api(ctypes.Structure):
+            _fields_ = [('Version', ctypes.c_int), ('LogicalLineType', ctypes.c_void_p),
+                        ('TokenTypeOfText', ctypes.c_void_p), ('ClearDerivedInfo', ctypes.c_void_p),
+                        ('AppendAttrib', ctypes.c_void_p), ('AppendTypeEquiv', ctypes.c_void_p),
+                        ('Tokenize', ctypes.c_void_p), ('SplitLogicals', ctypes.c_void_p)]
+
+        table = Api.from_address(ptr)
+        self.assertEqual(table.Version, 1)
+        self.assertEqual(table.LogicalLineType, id(fa.CLogicalLine))
+        for name, _ in Api._fields_[2:]:
+            self.assertTrue(getattr(table, name), name)
+        type_of = ctypes.CFUNCTYPE(ctypes.c_int, ctypes.c_char_p, ctypes.c_ssize_t)(
+            table.TokenTypeOfText)
+        self.assertEqual(type_of(b'->', 2), 51)
+        split = ctypes.PYFUNCTYPE(ctypes.py_object, ctypes.c_char_p, ctypes.c_ssize_t)(
+            table.SplitLogicals)
+        self.assertEqual([L.fKind for L in split(b'def f(): pass\n\n', 15)], [2, 22])
+        append = ctypes.PYFUNCTYPE(ctypes.c_int, ctypes.py_object, ctypes.py_object)(
+            table.AppendAttrib)
+        L = MakeLogical()
+        self.assertEqual(append(L, b'x'), 0)
+        self.assertEqual(L.fNamesDefined, [b'x'])
 
     def testLogger(self):
         records = []
