@@ -73,13 +73,14 @@ private:
   };
 
   void addToken(const Token &T, const SplitLogical &G) {
-    SplitToken S;
+    // Filled in place: a token built on the stack and copied stalls on store forwarding.
+    Out.Tokens.emplace_back();
+    SplitToken &S = Out.Tokens.back();
     S.Start = T.Start;
     S.End = T.End;
     S.Row = static_cast<int32_t>(T.Line - static_cast<size_t>(G.FirstLine));
     S.Col = static_cast<int32_t>(T.Col);
     S.Type = T.Type;
-    Out.Tokens.push_back(S);
   }
 
   /// True when the physical line at L.Pos starts with a statement-only keyword.
