@@ -8,20 +8,20 @@
 
 namespace treelens {
 
-// Slot conventions as in expr.h: borrowed results, failures throw tl::PyErrSet.
+// Slot conventions as in expr.h: new references, failures throw tl::PyErrSet.
 
 /// CFunctionParameterDef: slots 6 to 8.
 struct ParameterDefOps : NodeOps {
-  virtual PyObject *getNestedListNode(NodeObject *N) const; ///< c[1] of "(" list ")" or Py_None
-  virtual PyObject *getName(NodeObject *N) const;           ///< the NAME, Py_None for a nested list
-  virtual PyObject *getTypeExpr(NodeObject *N) const;       ///< annotation or Py_None
+  virtual tl::Ref getNestedListNode(NodeObject *N) const; ///< c[1] of "(" list ")" or Py_None
+  virtual tl::Ref getName(NodeObject *N) const;           ///< the NAME, Py_None for a nested list
+  virtual tl::Ref getTypeExpr(NodeObject *N) const;       ///< annotation or Py_None
 };
 
 /// CSingleUsedArgumentNode: slots 6 to 9.
 struct UsedArgumentOps : NodeOps {
-  virtual PyObject *getPrefix(NodeObject *N) const; ///< "*" / "**" text or Py_None
-  virtual PyObject *getName(NodeObject *N) const;   ///< keyword name node or Py_None
-  virtual PyObject *getValue(NodeObject *N) const;  ///< value node (the node itself unless keyword)
+  virtual tl::Ref getPrefix(NodeObject *N) const; ///< "*" / "**" text or Py_None
+  virtual tl::Ref getName(NodeObject *N) const;   ///< keyword name node or Py_None
+  virtual tl::Ref getValue(NodeObject *N) const;  ///< value node (the node itself unless keyword)
   virtual bool isUnparenthesizedGenExpr(NodeObject *N) const; ///< never raises
 };
 

@@ -9,9 +9,8 @@ namespace treelens {
 
 // Conventions of the slots declared here (the own slots of the classes; the
 // overrides of slots 6 and 7 keep ExpressionOps' conventions):
-// - PyObject * results are borrowed and never nullptr; a failure throws
-//   tl::PyErrSet with the Python error set. Results documented as "new" are
-//   returned as tl::Ref.
+// - Node and text results are new references (Py_None when absent); a
+//   failure throws tl::PyErrSet with the Python error set.
 // - Operations documented as "never raises" catch their own errors, report
 //   them as unraisable under the operation's qualified name and return
 //   false or 0.
@@ -25,7 +24,7 @@ struct AtomOps : ExpressionOps {
   Py_ssize_t getSubExprCount(NodeObject *N) const override; ///< never raises
   /// Slot 8: "[", "{", "(" (the child's own text object) or Py_None;
   /// ValueError "Atom node with no children".
-  virtual PyObject *getInitialBracket(NodeObject *N) const;
+  virtual tl::Ref getInitialBracket(NodeObject *N) const;
   virtual bool isLiteral(NodeObject *N) const;              ///< slot 9; never raises
   virtual bool isComprehension(NodeObject *N) const;        ///< slot 10; throws
   virtual bool isTwoPlusStringLiterals(NodeObject *N) const; ///< slot 11; never raises
@@ -33,18 +32,18 @@ struct AtomOps : ExpressionOps {
 
 /// CStarExpression: slot 8.
 struct StarExpressionOps : ExpressionOps {
-  virtual PyObject *getStarredExpression(NodeObject *N) const; ///< c[1]
+  virtual tl::Ref getStarredExpression(NodeObject *N) const; ///< c[1]
 };
 
 /// CLambdaExpr: slots 8, 9 (native-only).
 struct LambdaOps : ExpressionOps {
-  virtual PyObject *getArgumentsNode(NodeObject *N) const; ///< c[1] or Py_None
-  virtual PyObject *getBodyExpr(NodeObject *N) const;      ///< c[-1]
+  virtual tl::Ref getArgumentsNode(NodeObject *N) const; ///< c[1] or Py_None
+  virtual tl::Ref getBodyExpr(NodeObject *N) const;      ///< c[-1]
 };
 
 /// CYieldExpr: slots 8, 9.
 struct YieldExprOps : ExpressionOps {
-  virtual PyObject *getValue(NodeObject *N) const;
+  virtual tl::Ref getValue(NodeObject *N) const;
   virtual bool isYieldFrom(NodeObject *N) const; ///< never raises
 };
 
@@ -59,16 +58,16 @@ struct TestListStarExprOps : ExpressionOps {
 
 /// CAtomExpr: slots 8 to 10.
 struct AtomExprOps : ExpressionOps {
-  virtual PyObject *getPrefix(NodeObject *N) const; ///< the "await" keyword node or Py_None
-  virtual PyObject *getAtom(NodeObject *N) const;
+  virtual tl::Ref getPrefix(NodeObject *N) const; ///< the "await" keyword node or Py_None
+  virtual tl::Ref getAtom(NodeObject *N) const;
   virtual tl::Ref getTrailers(NodeObject *N) const; ///< new list
 };
 
 /// CPower: slots 8 to 10.
 struct PowerOps : ExpressionOps {
-  virtual PyObject *getAtom(NodeObject *N) const;
+  virtual tl::Ref getAtom(NodeObject *N) const;
   virtual tl::Ref getTrailers(NodeObject *N) const; ///< new list
-  virtual PyObject *getExponentNode(NodeObject *N) const;
+  virtual tl::Ref getExponentNode(NodeObject *N) const;
 };
 
 /// CNumberLiteral: slot 8.
@@ -84,34 +83,34 @@ struct StringLiteralOps : ExpressionOps {
 
 /// CFactorExpr: slot 8.
 struct FactorOps : ExpressionOps {
-  virtual PyObject *getUnaryOperator(NodeObject *N) const; ///< "+", "-", "~" or Py_None
+  virtual tl::Ref getUnaryOperator(NodeObject *N) const; ///< "+", "-", "~" or Py_None
 };
 
 /// CYieldArg (a CNode): slots 6, 7.
 struct YieldArgOps : NodeOps {
-  virtual PyObject *getValue(NodeObject *N) const;
+  virtual tl::Ref getValue(NodeObject *N) const;
   virtual bool isYieldFrom(NodeObject *N) const; ///< never raises
 };
 
 /// CCompForNode (a CNode): slots 6 to 9.
 struct CompForOps : NodeOps {
   virtual bool isAsync(NodeObject *N) const; ///< never raises
-  virtual PyObject *getTargetNode(NodeObject *N) const;
-  virtual PyObject *getInNode(NodeObject *N) const;
-  virtual PyObject *getCompIterNode(NodeObject *N) const; ///< Py_None unless len is 5 (+1 if async)
+  virtual tl::Ref getTargetNode(NodeObject *N) const;
+  virtual tl::Ref getInNode(NodeObject *N) const;
+  virtual tl::Ref getCompIterNode(NodeObject *N) const; ///< Py_None unless len is 5 (+1 if async)
 };
 
 /// CListmakerNode (a CNode): slots 6, 7 (count first).
 struct ListmakerOps : NodeOps {
   virtual Py_ssize_t getSubExprCount(NodeObject *N) const; ///< never raises
-  virtual PyObject *getSubExpr(NodeObject *N, Py_ssize_t I) const;
+  virtual tl::Ref getSubExpr(NodeObject *N, Py_ssize_t I) const;
 };
 
 /// CTrailer: its operations are Python-level only; these are their native bodies.
 struct TrailerOps : NodeOps {
-  virtual PyObject *getDotName(NodeObject *N) const;      ///< attribute name text or Py_None
-  virtual PyObject *getNestedNode(NodeObject *N) const;   ///< c[1] of "(" x ")" / "[" x "]", or Py_None
-  virtual PyObject *getInitialToken(NodeObject *N) const; ///< ValueError "Trailer node with no children"
+  virtual tl::Ref getDotName(NodeObject *N) const;      ///< attribute name text or Py_None
+  virtual tl::Ref getNestedNode(NodeObject *N) const;   ///< c[1] of "(" x ")" / "[" x "]", or Py_None
+  virtual tl::Ref getInitialToken(NodeObject *N) const; ///< ValueError "Trailer node with no children"
 };
 
 // ---- Native callers. Node results are new references (None when absent);
