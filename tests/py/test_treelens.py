@@ -320,6 +320,8 @@ class ParserTest(unittest.TestCase):
                  ('3.6', b'await x\n', True, True),
                  ('3.6', b'async = 1\n', True, False),
                  ('3.6', b'async  \\\n def f(): pass\n', False, True),
+                 ('3.6', b'async def f(): return await x\n', False, True),
+                 ('3.6', b'def f(): return await x\n', False, False),
                  ('3.7', b'await x\n', False, True),
                  ('3.7', b'async = 1\n', False, False),
                  ('3.7', b'async def f(): pass\n', False, True)]

@@ -232,9 +232,14 @@ PyObject *analyzer_AnalyzeSingleLogical(PyObject *Self, PyObject *Args, PyObject
   return tl::guard<PyObject *>(nullptr, [&] {
     static const char *Keywords[] = {"logical", "in_async_def", nullptr};
     PyObject *Logical, *InAsyncDef;
-    if (!PyArg_ParseTupleAndKeywords(Args, Kwds, "OO:AnalyzeSingleLogical", const_cast<char **>(Keywords),
-                                     &Logical, &InAsyncDef))
+    // The host calls this once per line: positional arguments skip the parser.
+    if (!Kwds && PyTuple_GET_SIZE(Args) == 2) {
+      Logical = PyTuple_GET_ITEM(Args, 0);
+      InAsyncDef = PyTuple_GET_ITEM(Args, 1);
+    } else if (!PyArg_ParseTupleAndKeywords(Args, Kwds, "OO:AnalyzeSingleLogical",
+                                            const_cast<char **>(Keywords), &Logical, &InAsyncDef)) {
       throw tl::PyErrSet();
+    }
     return analyzeSingleLogical(self(Self), Logical, truth(InAsyncDef)).release();
   });
 }

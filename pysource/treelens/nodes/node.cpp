@@ -378,15 +378,6 @@ int node_clear(PyObject *Self) {
   return 0;
 }
 
-// A free list is a chain through NextFree; the trashcan keeps releasing a
-// long chain from recursing deeply.
-void node_dealloc(PyObject *Self) {
-  PyObject_GC_UnTrack(Self);
-  Py_TRASHCAN_SAFE_BEGIN(Self)
-  node_clear(Self);
-  Py_TYPE(Self)->tp_free(Self);
-  Py_TRASHCAN_SAFE_END(Self)
-}
 
 PyObject *node_repr(PyObject *Self) {
   return tl::guard<PyObject *>(nullptr, [&] {
@@ -397,6 +388,16 @@ PyObject *node_repr(PyObject *Self) {
 }
 
 } // namespace
+
+// A free list is a chain through NextFree; the trashcan keeps releasing a
+// long chain from recursing deeply.
+void nodeDealloc(PyObject *Self) {
+  PyObject_GC_UnTrack(Self);
+  Py_TRASHCAN_SAFE_BEGIN(Self)
+  node_clear(Self);
+  Py_TYPE(Self)->tp_free(Self);
+  Py_TRASHCAN_SAFE_END(Self)
+}
 
 NodeObject *allocNode(PyTypeObject *T, ClassInfoObject *Info) {
   NodeObject *N = reinterpret_cast<NodeObject *>(T->tp_alloc(T, 0));
@@ -438,7 +439,7 @@ int initNodeTypes(PyObject *Module) {
       D.Methods = Methods;
       if (Root) {
         D.GetSets = NodeGetSets;
-        D.Dealloc = node_dealloc;
+        D.Dealloc = nodeDealloc;
         D.Traverse = node_traverse;
         D.Clear = node_clear;
         D.Init = node_init;

@@ -118,8 +118,14 @@ TL_HIDDEN PyTypeObject &nodeType(NodeClass C);
 
 inline PyTypeObject &cnodeType() { return nodeType(NodeClass::CNode); }
 
-/// True when O is a CNode (any subclass).
-inline bool isNode(PyObject *O) { return PyObject_TypeCheck(O, &cnodeType()); }
+/// The deallocator every native node class shares.
+TL_HIDDEN void nodeDealloc(PyObject *Self);
+
+/// True when O is a CNode (any subclass). Native node classes share their
+/// deallocator, which answers without walking the class's bases.
+inline bool isNode(PyObject *O) {
+  return Py_TYPE(O)->tp_dealloc == nodeDealloc || PyObject_TypeCheck(O, &cnodeType());
+}
 
 /// True when O is an instance of the native class C (subclasses included).
 inline bool isNodeOf(PyObject *O, NodeClass C) { return PyObject_TypeCheck(O, &nodeType(C)); }

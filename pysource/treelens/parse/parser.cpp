@@ -208,9 +208,13 @@ template <class Source> Ref parseTokens(ParserObject *P, const Source &S, bool A
       } else if (textIs(Tok, Synth.Else)) {
         addSynth(P, {&Synth.If, &Synth.Zero, &Synth.Colon, &Synth.Pass, &Synth.Newline}, Context.get());
       } else if (!AsyncKw && textIs(Tok, Synth.Async)) {
+        // An async def: as in the language's own tokenizer, async and await
+        // are keywords from here on, so a body on the same line may await.
         PyObject *Next = S.nextKept(I);
-        if (Next && textIs(Next, Synth.Def.Text))
+        if (Next && textIs(Next, Synth.Def.Text)) {
           TokType = kAsync;
+          AsyncKw = true;
+        }
       }
     } else if (First && TokType == kAt) {
       Decorator = true;
