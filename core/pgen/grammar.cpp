@@ -11,6 +11,10 @@ namespace {
 constexpr long MaxSymbol = FirstSymbol + (1 << 20);
 /// Labels, states and arcs are counted in 32 bits with room to spare.
 constexpr size_t MaxCount = 1u << 30;
+/// Bound of the move table and pool, in entries.
+constexpr size_t MaxMoves = size_t(1) << 26;
+/// Pushes one precomputed move makes at most.
+constexpr uint32_t MaxChain = 64;
 
 uint32_t hashText(const char *Text, size_t Len) {
   uint32_t H = 2166136261u;
@@ -161,12 +165,89 @@ std::unique_ptr<Grammar> Grammar::compile(const GrammarSource &Src,
     }
   }
 
+  // Terminals and their moves.
+  G->Terminals.assign(NumLabels, 0);
+  std::vector<uint32_t> TerminalLabels;
+  for (size_t L = 0; L < NumLabels; ++L)
+    if (Src.Labels[L] < FirstSymbol) {
+      G->Terminals[L] = static_cast<uint32_t>(TerminalLabels.size());
+      TerminalLabels.push_back(static_cast<uint32_t>(L));
+    }
+  G->TerminalCount = TerminalLabels.size();
+  if (G->States.size() * G->TerminalCount > MaxMoves) {
+    Error = "grammar is too large";
+    return nullptr;
+  }
+  G->AcceptOnlyStates.resize(G->States.size());
+  for (size_t S = 0; S < G->States.size(); ++S)
+    G->AcceptOnlyStates[S] = G->States[S].AcceptOnly;
+  G->Pool.assign(MoveFirst, 0);
+  G->Moves.assign(G->States.size() * G->TerminalCount, MoveError);
+  for (size_t S = 0; S < G->States.size(); ++S) {
+    for (size_t T = 0; T < G->TerminalCount; ++T)
+      G->Moves[S * G->TerminalCount + T] =
+          G->buildMove(static_cast<uint32_t>(S), TerminalLabels[T]);
+    if (G->Pool.size() > MaxMoves) {
+      Error = "grammar is too large";
+      return nullptr;
+    }
+  }
+
   if (G->dfaOfSymbol(Src.Start) < 0) {
     Error = describe("start symbol has no DFA:", Src.Start);
     return nullptr;
   }
   G->Start = Src.Start;
   return G;
+}
+
+const Grammar::Arc *Grammar::firstArc(uint32_t S, uint32_t L) const {
+  const State &St = States[S];
+  for (uint32_t A = St.FirstArc; A < St.FirstArc + St.NumArcs; ++A) {
+    const Arc &Ar = Arcs[A];
+    if (Ar.Label == L || (Ar.Push >= 0 && inFirst(Dfas[Ar.Push], L)))
+      return &Ar;
+  }
+  return nullptr;
+}
+
+uint32_t Grammar::buildMove(uint32_t S, uint32_t L) {
+  const Arc *A = firstArc(S, L);
+  if (!A)
+    return States[S].CanAccept ? MovePop : MoveError;
+  uint32_t M = static_cast<uint32_t>(Pool.size());
+  Pool.push_back(0);
+  uint32_t Pushes = 0;
+  uint32_t Header = 0;
+  for (;;) {
+    if (A->Label == L) {
+      Pool.push_back(A->Next);
+      Header = MoveShifts;
+      break;
+    }
+    const Dfa &D = Dfas[A->Push];
+    Pool.push_back(A->Next);
+    Pool.push_back(static_cast<uint32_t>(D.Symbol));
+    ++Pushes;
+    // Stop at a symbol that does not take L at once (possible only with
+    // first sets that disagree with the arcs) or at a long chain; the
+    // driver goes on from the pushed symbol's first state.
+    A = Pushes < MaxChain ? firstArc(D.FirstState, L) : nullptr;
+    if (!A) {
+      Pool.push_back(D.FirstState);
+      break;
+    }
+  }
+  Pool[M] = Header | Pushes;
+  return M;
+}
+
+size_t Grammar::tableBytes() const {
+  return sizeof(*this) + Arcs.size() * sizeof(Arc) +
+         States.size() * sizeof(State) + Dfas.size() * sizeof(Dfa) +
+         FirstBits.size() * 8 + SymbolDfas.size() * 4 + Terminals.size() * 4 +
+         Moves.size() * 4 + Pool.size() * 4 + AcceptOnlyStates.size() +
+         KeywordSlots.size() * sizeof(KeywordSlot) + KeywordText.size();
 }
 
 int Grammar::keywordLabel(const char *Text, size_t Len) const {

@@ -40,6 +40,12 @@ struct GrammarSource {
 };
 
 /// Immutable parse tables compiled from a GrammarSource; shared by parsers.
+///
+/// The arcs and first sets are compiled into one move per (state, terminal):
+/// the first arc of the state, in grammar order, that carries the terminal's
+/// label or pushes a symbol whose first set holds it (the choice lib2to3's
+/// parser makes by scanning the arcs), followed through every push it leads
+/// to until the terminal is shifted.
 class Grammar {
 public:
   /// One transition. Push is the DFA index of a symbol label, else -1.
@@ -63,6 +69,15 @@ public:
     uint32_t FirstSet; ///< offset of its first set in FirstBits
   };
 
+  /// move() results below MoveFirst: no arc takes the terminal.
+  static constexpr uint32_t MoveError = 0; ///< and the state cannot accept
+  static constexpr uint32_t MovePop = 1;   ///< and the state accepts
+  static constexpr uint32_t MoveFirst = 2;
+  /// A move at offset M of the pool: moveHeader(M) holds the push count N
+  /// and MoveShifts; then N pairs (state the frame below continues in,
+  /// symbol pushed); then the state the top frame ends in.
+  static constexpr uint32_t MoveShifts = 0x80000000u;
+
   /// Validates and compiles Source; null with a message in Error on failure.
   static std::unique_ptr<Grammar> compile(const GrammarSource &Source,
                                           std::string &Error);
@@ -79,6 +94,16 @@ public:
     return TokenLabels[Type];
   }
 
+  /// Dense terminal index of a token label (type < 256).
+  uint32_t terminalOf(uint32_t Label) const { return Terminals[Label]; }
+
+  /// What state S does on terminal T: MoveError, MovePop or a pool offset.
+  uint32_t move(uint32_t S, uint32_t T) const {
+    return Moves[static_cast<size_t>(S) * TerminalCount + T];
+  }
+  const uint32_t *movePool(uint32_t M) const { return &Pool[M]; }
+  bool acceptOnly(uint32_t S) const { return AcceptOnlyStates[S] != 0; }
+
   /// DFA index of a symbol number, or -1.
   int dfaOfSymbol(int Symbol) const {
     size_t I = static_cast<size_t>(Symbol) - FirstSymbol;
@@ -91,6 +116,8 @@ public:
   }
 
   int startSymbol() const { return Start; }
+  /// Bytes held by the compiled tables.
+  size_t tableBytes() const;
   size_t labelCount() const { return LabelCount; }
   const Dfa &dfa(size_t I) const { return Dfas[I]; }
   const State &state(size_t I) const { return States[I]; }
@@ -99,6 +126,10 @@ public:
 private:
   Grammar() = default;
   int keywordLabel(const char *Text, size_t Len) const;
+  /// First arc of state S that takes label L, directly or by a push.
+  const Arc *firstArc(uint32_t S, uint32_t L) const;
+  /// Appends the move of state S on label L to Pool; its move() value.
+  uint32_t buildMove(uint32_t S, uint32_t L);
 
   struct KeywordSlot {
     uint32_t Hash;
@@ -111,6 +142,11 @@ private:
   std::vector<Dfa> Dfas;
   std::vector<uint64_t> FirstBits;
   std::vector<int32_t> SymbolDfas; ///< symbol - 256 -> DFA index or -1
+  std::vector<uint32_t> Terminals; ///< label -> terminal index (symbols: 0)
+  std::vector<uint32_t> Moves;     ///< [state][terminal], see move()
+  std::vector<uint32_t> Pool;      ///< the moves' pushes
+  std::vector<uint8_t> AcceptOnlyStates;
+  size_t TerminalCount = 0;
   int32_t TokenLabels[256];
   std::vector<KeywordSlot> KeywordSlots; ///< open addressing, power of 2
   std::string KeywordText;

@@ -6,7 +6,7 @@
 #include "grammar.h"
 
 #include <cstddef>
-#include <vector>
+#include <memory>
 
 namespace pgen {
 
@@ -23,6 +23,9 @@ enum class Status {
   NotReady,     ///< no setup() since construction or since the last error
 };
 
+/// Open nonterminals allowed at once; the bound of CPython's own parser.
+constexpr size_t MaxParseDepth = 1500;
+
 /// Drives one parse at a time over a shared Grammar.
 ///
 /// Sink must provide, each returning false to abort the parse:
@@ -33,10 +36,10 @@ enum class Status {
 /// setup() calls none of them: the sink opens the start symbol itself.
 template <class Sink> class Parser {
 public:
-  /// Open nonterminals allowed at once; the bound of CPython's own parser.
-  static constexpr size_t MaxDepth = 1500;
+  static constexpr size_t MaxDepth = MaxParseDepth;
 
-  Parser(const Grammar &G, Sink &S) : G(G), S(S) { Stack.reserve(MaxDepth); }
+  Parser(const Grammar &G, Sink &S)
+      : G(G), S(S), Stack(new Frame[MaxDepth]) {}
 
   /// Starts a new input at StartSymbol; false when it has no DFA.
   bool setup(int StartSymbol) {
@@ -44,14 +47,14 @@ public:
     int D = G.dfaOfSymbol(StartSymbol);
     if (D < 0)
       return false;
-    Stack.push_back(Frame{static_cast<uint32_t>(D), G.dfa(D).FirstState});
+    Stack[Depth++] = Frame{StartSymbol, G.dfa(D).FirstState};
     Latched = Status::Ok;
     return true;
   }
 
   /// Drops the input; addToken gives NotReady until setup().
   void reset() {
-    Stack.clear();
+    Depth = 0;
     Latched = Status::NotReady;
   }
 
@@ -63,62 +66,61 @@ public:
     int L = G.classify(Type, Text, Len);
     if (L < 0)
       return fail(Status::BadToken);
-    const uint32_t Label = static_cast<uint32_t>(L);
+    const uint32_t Terminal = G.terminalOf(static_cast<uint32_t>(L));
     for (;;) {
-      Frame &Top = Stack.back();
-      const Grammar::State &St = G.state(Top.State);
-      const Grammar::Arc *A = &G.arc(St.FirstArc);
-      const Grammar::Arc *End = A + St.NumArcs;
-      for (; A != End; ++A) {
-        if (A->Label == Label) {
-          if (!S.shift())
-            return fail(Status::Aborted);
-          Top.State = A->Next;
-          // Pop every nonterminal left in a state that can only accept.
-          while (G.state(Stack.back().State).AcceptOnly) {
-            if (!popFrame())
-              return fail(Status::Aborted);
-            if (Stack.empty())
-              return Latched = Status::Done;
-          }
-          return Status::Ok;
-        }
-        if (A->Push >= 0 && G.inFirst(G.dfa(A->Push), Label)) {
-          if (Stack.size() >= MaxDepth)
-            return fail(Status::TooDeep);
-          Top.State = A->Next;
-          const Grammar::Dfa &D = G.dfa(A->Push);
-          Stack.push_back(Frame{static_cast<uint32_t>(A->Push), D.FirstState});
-          if (!S.push(D.Symbol))
-            return fail(Status::Aborted);
-          break;
-        }
-      }
-      if (A != End)
+      uint32_t M = G.move(top().State, Terminal);
+      if (M < Grammar::MoveFirst) {
+        // No arc takes the token: an accepting state pops, else an error.
+        if (M == Grammar::MoveError)
+          return fail(Status::BadInput);
+        if (!popFrame())
+          return fail(Status::Aborted);
+        if (Depth == 0)
+          return fail(Status::TooMuchInput);
         continue;
-      if (!St.CanAccept)
-        return fail(Status::BadInput);
-      if (!popFrame())
+      }
+      // Open the symbols the token starts, then shift it.
+      const uint32_t *P = G.movePool(M);
+      const uint32_t Pushes = P[0] & ~Grammar::MoveShifts;
+      const bool Shifts = (P[0] & Grammar::MoveShifts) != 0;
+      ++P;
+      if (Depth + Pushes > MaxDepth)
+        return fail(Status::TooDeep);
+      for (uint32_t I = 0; I < Pushes; ++I, P += 2) {
+        top().State = P[0];
+        Stack[Depth++] = Frame{static_cast<int>(P[1]), 0};
+        if (!S.push(static_cast<int>(P[1])))
+          return fail(Status::Aborted);
+      }
+      top().State = *P;
+      if (!Shifts)
+        continue;
+      if (!S.shift())
         return fail(Status::Aborted);
-      if (Stack.empty())
-        return fail(Status::TooMuchInput);
+      // Pop every nonterminal left in a state that can only accept.
+      while (G.acceptOnly(top().State)) {
+        if (!popFrame())
+          return fail(Status::Aborted);
+        if (Depth == 0)
+          return Latched = Status::Done;
+      }
+      return Status::Ok;
     }
   }
 
   Status status() const { return Latched; }
   /// Nonterminals open now.
-  size_t depth() const { return Stack.size(); }
+  size_t depth() const { return Depth; }
 
 private:
-  /// One open nonterminal: its DFA and current (global) state.
+  /// One open nonterminal: its symbol and current (global) state.
   struct Frame {
-    uint32_t Dfa;
+    int Symbol;
     uint32_t State;
   };
 
   bool popFrame() {
-    int Symbol = G.dfa(Stack.back().Dfa).Symbol;
-    Stack.pop_back();
+    int Symbol = Stack[--Depth].Symbol;
     return S.pop(Symbol);
   }
 
@@ -128,9 +130,13 @@ private:
     return E;
   }
 
+  Frame &top() { return Stack[Depth - 1]; }
+
   const Grammar &G;
   Sink &S;
-  std::vector<Frame> Stack; ///< innermost last; empty when done
+  /// Stack[0, Depth): the open nonterminals, innermost last; empty when done.
+  std::unique_ptr<Frame[]> Stack;
+  size_t Depth = 0;
   Status Latched = Status::NotReady;
 };
 

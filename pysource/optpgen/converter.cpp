@@ -57,29 +57,44 @@ PyMethodDef ConverterMethods[] = {
      "children: a new list). None drops the node."},
     {nullptr, nullptr, 0, nullptr}};
 
-/// Counts its calls and drops every node.
+/// Counts its calls; keeps a token as its text and a nonterminal as its
+/// children list, or drops every node.
 struct NoOpConverterObject {
   NodeConverterObject Base;
   long Tokens;
   long Nodes;
+  bool Drop;
 };
 
-PyObject *noOpConvert(PyObject *Self, PyObject *, int, PyObject *,
+PyObject *noOpConvert(PyObject *Self, PyObject *, int, PyObject *Value,
                       PyObject *, PyObject *Children) {
   auto *C = reinterpret_cast<NoOpConverterObject *>(Self);
+  PyObject *Result = Children == Py_None ? Value : Children;
   if (Children == Py_None)
     ++C->Tokens;
   else
     ++C->Nodes;
-  Py_RETURN_NONE;
+  if (C->Drop)
+    Result = Py_None;
+  Py_INCREF(Result);
+  return Result;
 }
 
 PyObject *noop_new(PyTypeObject *Type, PyObject *Args, PyObject *Kw) {
+  PyObject *Drop = Py_False;
+  static const char *Names[] = {"drop", nullptr};
+  if (!PyArg_ParseTupleAndKeywords(Args, Kw, "|O:_NoOpConverter",
+                                   const_cast<char **>(Names), &Drop))
+    return nullptr;
+  int DropAll = PyObject_IsTrue(Drop);
+  if (DropAll < 0)
+    return nullptr;
   PyObject *Self = converter_new(Type, Args, Kw);
   if (Self) {
     auto *C = reinterpret_cast<NoOpConverterObject *>(Self);
     C->Base.NativeConvert = noOpConvert;
     C->Tokens = C->Nodes = 0;
+    C->Drop = DropAll != 0;
   }
   return Self;
 }
@@ -130,8 +145,10 @@ int initConverters(PyObject *Module) {
 
   tl::TypeDesc N;
   N.Name = "pysource.optpgen._NoOpConverter";
-  N.Doc = "_NoOpConverter()\n\nA native converter that drops every node and "
-          "counts its calls in `tokens` and `nodes` (tests and benchmarks).";
+  N.Doc = "_NoOpConverter(drop=False)\n\nA native converter for tests and "
+          "benchmarks: a token becomes its text, a nonterminal its children "
+          "list (with drop, every node is dropped); calls are counted in "
+          "`tokens` and `nodes`.";
   N.Size = sizeof(NoOpConverterObject);
   N.Base = &NodeConverterType;
   N.Members = NoOpMembers;

@@ -55,6 +55,10 @@ PyMethodDef ModuleMethods[] = {
      "node_type, value, context, children), or None for raw tuples. With "
      "promotesinglechild a nonterminal with exactly one child is replaced "
      "by that child and not converted."},
+    {"_FeedTokens", optpgen::feedTokens, METH_VARARGS,
+     "_FeedTokens(parser, tokens) -> bool\n\nparser.setup(), then "
+     "parser.addtoken(*t) for each t of tokens until it returns True; "
+     "returns the last result."},
     {"_GetTablesBuildCount", module_tablesbuilt, METH_NOARGS,
      "_GetTablesBuildCount() -> number of grammar objects compiled so far"},
     {nullptr, nullptr, 0, nullptr}};

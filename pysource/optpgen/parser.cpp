@@ -8,7 +8,7 @@
 #include "pgen/parser.h"
 #include "tables.h"
 
-#include <vector>
+#include <memory>
 
 namespace optpgen {
 
@@ -30,6 +30,24 @@ struct NodeFrame {
   PyObject *Children;
 };
 
+/// The nonterminals being built, parallel to the engine's stack (which
+/// never holds more than its MaxDepth).
+class FrameStack {
+public:
+  static constexpr size_t Capacity = pgen::MaxParseDepth;
+  FrameStack() : Frames(new NodeFrame[Capacity]) {}
+  bool empty() const { return Size == 0; }
+  NodeFrame &back() { return Frames[Size - 1]; }
+  void push_back(const NodeFrame &F) { Frames[Size++] = F; }
+  void pop_back() { --Size; }
+  const NodeFrame *begin() const { return &Frames[0]; }
+  const NodeFrame *end() const { return &Frames[Size]; }
+
+private:
+  std::unique_ptr<NodeFrame[]> Frames;
+  size_t Size = 0;
+};
+
 /// Parser state; the engine's sink.
 class ParserImpl {
 public:
@@ -38,7 +56,6 @@ public:
         Raw(C == nullptr), Driver(*Tables, *this) {
     Py_INCREF(Grammar);
     Py_XINCREF(Converter);
-    Frames.reserve(pgen::Parser<ParserImpl>::MaxDepth);
     Native = Raw ? nullptr : nativeConvertOf(Converter);
   }
   ~ParserImpl() { clear(); }
@@ -121,7 +138,7 @@ public:
   bool Raw;                       ///< no converter: (type, value, context, children)
   bool Busy = false;              ///< inside addtoken, setup or a release
   ConvertFunc Native = nullptr;   ///< set when the converter's slot is used
-  std::vector<NodeFrame> Frames;  ///< parallel to the engine's stack
+  FrameStack Frames;
   pgen::Parser<ParserImpl> Driver;
 
   // The token being added; borrowed for the duration of addtoken.
@@ -243,6 +260,54 @@ const char *statusMessage(pgen::Status S) {
   }
 }
 
+/// Adds one token: Py_True or Py_False (new reference); throws PyErrSet.
+/// All arguments borrowed.
+PyObject *addToken(PyObject *Self, PyObject *TypeObj, PyObject *Value,
+                   PyObject *Context) {
+  ParserImpl &P = impl(Self);
+  const char *Text = nullptr;
+  Py_ssize_t Len = 0;
+  Ref Utf8;
+  if (PyString_Check(Value)) {
+    Text = PyString_AS_STRING(Value);
+    Len = PyString_GET_SIZE(Value);
+  } else if (PyUnicode_Check(Value)) {
+    Utf8 = Ref::steal(PyUnicode_AsUTF8String(Value));
+    if (Utf8) {
+      Text = PyString_AS_STRING(Utf8.get());
+      Len = PyString_GET_SIZE(Utf8.get());
+    } else {
+      PyErr_Clear(); // not encodable: no keyword
+    }
+  }
+
+  pgen::Status S;
+  {
+    BusyScope Busy(P);
+    P.TypeObj = TypeObj;
+    P.Type = tokenType(TypeObj);
+    P.Value = Value;
+    P.Context = Context;
+    S = P.Driver.addToken(P.Type, Text, static_cast<size_t>(Len));
+    if (S == pgen::Status::Ok)
+      Py_RETURN_FALSE;
+    if (S == pgen::Status::Done)
+      Py_RETURN_TRUE;
+    if (S == pgen::Status::NotReady)
+      tl::raise(PyExc_RuntimeError, msg::NotReady);
+    // Release the partial trees now; keep a convert error across it.
+    PyObject *ET, *EV, *ETb;
+    PyErr_Fetch(&ET, &EV, &ETb);
+    P.clearTree();
+    PyErr_Restore(ET, EV, ETb);
+  }
+  if (const char *M = statusMessage(S))
+    raiseParseError(M, TypeObj, Value, Context);
+  if (!PyErr_Occurred())
+    PyErr_SetString(PyExc_SystemError, "convert failed without an error");
+  throw tl::PyErrSet();
+}
+
 PyObject *parser_addtoken(PyObject *Self, PyObject *Args, PyObject *Kw) {
   return guard<PyObject *>(nullptr, [&]() -> PyObject * {
     PyObject *TypeObj, *Value, *Context;
@@ -256,48 +321,7 @@ PyObject *parser_addtoken(PyObject *Self, PyObject *Args, PyObject *Kw) {
                                             &TypeObj, &Value, &Context)) {
       throw tl::PyErrSet();
     }
-    ParserImpl &P = impl(Self);
-    const char *Text = nullptr;
-    Py_ssize_t Len = 0;
-    Ref Utf8;
-    if (PyString_Check(Value)) {
-      Text = PyString_AS_STRING(Value);
-      Len = PyString_GET_SIZE(Value);
-    } else if (PyUnicode_Check(Value)) {
-      Utf8 = Ref::steal(PyUnicode_AsUTF8String(Value));
-      if (Utf8) {
-        Text = PyString_AS_STRING(Utf8.get());
-        Len = PyString_GET_SIZE(Utf8.get());
-      } else {
-        PyErr_Clear(); // not encodable: no keyword
-      }
-    }
-
-    pgen::Status S;
-    {
-      BusyScope Busy(P);
-      P.TypeObj = TypeObj;
-      P.Type = tokenType(TypeObj);
-      P.Value = Value;
-      P.Context = Context;
-      S = P.Driver.addToken(P.Type, Text, static_cast<size_t>(Len));
-      if (S == pgen::Status::Ok)
-        Py_RETURN_FALSE;
-      if (S == pgen::Status::Done)
-        Py_RETURN_TRUE;
-      if (S == pgen::Status::NotReady)
-        tl::raise(PyExc_RuntimeError, msg::NotReady);
-      // Release the partial trees now; keep a convert error across it.
-      PyObject *ET, *EV, *ETb;
-      PyErr_Fetch(&ET, &EV, &ETb);
-      P.clearTree();
-      PyErr_Restore(ET, EV, ETb);
-    }
-    if (const char *M = statusMessage(S))
-      raiseParseError(M, TypeObj, Value, Context);
-    if (!PyErr_Occurred())
-      PyErr_SetString(PyExc_SystemError, "convert failed without an error");
-    throw tl::PyErrSet();
+    return addToken(Self, TypeObj, Value, Context);
   });
 }
 
@@ -436,6 +460,29 @@ PyGetSetDef ParserGetSets[] = {
 
 } // namespace
 
+PyObject *feedTokens(PyObject *, PyObject *Args) {
+  return guard<PyObject *>(nullptr, [&]() -> PyObject * {
+    PyObject *Self, *Tokens;
+    if (!PyArg_ParseTuple(Args, "O!O:_FeedTokens", &ParserType, &Self, &Tokens))
+      throw tl::PyErrSet();
+    Ref Seq = require(PySequence_Fast(Tokens, "tokens must be a sequence"));
+    Ref NoArgs = require(PyTuple_New(0));
+    require(parser_setup(Self, NoArgs.get(), nullptr));
+    Ref Result = Ref::borrow(Py_False);
+    for (Py_ssize_t I = 0, N = PySequence_Fast_GET_SIZE(Seq.get()); I < N;
+         ++I) {
+      PyObject *T = PySequence_Fast_GET_ITEM(Seq.get(), I);
+      if (!PyTuple_Check(T) || PyTuple_GET_SIZE(T) != 3)
+        tl::expectType(false, "a (type, value, context) tuple", T);
+      Result = require(addToken(Self, PyTuple_GET_ITEM(T, 0),
+                                PyTuple_GET_ITEM(T, 1), PyTuple_GET_ITEM(T, 2)));
+      if (Result.get() == Py_True)
+        break;
+    }
+    return Result.release();
+  });
+}
+
 PyObject *createParser(PyObject *, PyObject *Args, PyObject *Kw) {
   return guard<PyObject *>(nullptr, [&] {
     PyObject *Grammar, *Converter, *Promote = Py_False;
@@ -470,7 +517,7 @@ int initParser(PyObject *Module) {
   if (tl::readyType(ParserType, D) < 0)
     return -1;
   if (PyModule_AddIntConstant(Module, "kMaxDepth",
-                              pgen::Parser<ParserImpl>::MaxDepth) < 0)
+                              pgen::MaxParseDepth) < 0)
     return -1;
   return tl::addType(Module, "Parser", ParserType);
 }

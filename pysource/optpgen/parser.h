@@ -15,6 +15,10 @@ TL_HIDDEN extern PyObject *ParseErrorType;
 TL_HIDDEN PyObject *createParser(PyObject *Module, PyObject *Args,
                                  PyObject *Kw);
 
+/// _FeedTokens(parser, tokens): setup(), then addtoken for each (type,
+/// value, context) until it returns True; returns the last result.
+TL_HIDDEN PyObject *feedTokens(PyObject *Module, PyObject *Args);
+
 /// Readies Parser and adds it to Module; -1 on failure.
 TL_HIDDEN int initParser(PyObject *Module);
 

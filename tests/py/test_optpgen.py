@@ -197,20 +197,25 @@ class ConverterPathTest(OptpgenTestBase):
                 return node_type
         cases = [
             ('native', optpgen._NoOpConverter(), True),
+            ('native dropping', optpgen._NoOpConverter(drop=True), True),
             ('subclass without convert', Plain(), True),
             ('subclass overriding convert', Override(), False),
             ('object with convert', Other(), False),
             ('raw', None, False),
         ]
+        # Tokens become their text (ENDMARKER's None drops it), nonterminals
+        # their children.
+        tree = [['x', '=', [['a'], '+', ['1']], '\n']]
         for name, conv, native in cases:
             p = optpgen.CreateParser(self.grammar, conv)
             self.assertTrue(Feed(p, kAssign), name)
             self.assertEqual(native, p._usesnative, name)
             if isinstance(conv, optpgen._NoOpConverter):
                 self.assertEqual((7, 5), (conv.tokens, conv.nodes), name)
-                self.assertIsNone(p.getrootnode(), name)
+                self.assertEqual(None if 'drop' in name else tree,
+                                 p.getrootnode(), name)
         # The override saw every call, and then ran the native slot.
-        self.assertEqual(12, cases[2][1].seen)
+        self.assertEqual(12, cases[3][1].seen)
 
     def testBaseConverterAndBadConverters(self):
         p = optpgen.CreateParser(self.grammar, optpgen.NodeConverter())
@@ -221,9 +226,14 @@ class ConverterPathTest(OptpgenTestBase):
             optpgen.CreateParser(self.grammar, object())
         with self.assertRaises(NotImplementedError):
             optpgen.NodeConverter().convert(self.grammar, 1, 'x', 0, None)
-        self.assertEqual((None, 0, 0), (
-            optpgen._NoOpConverter().convert(self.grammar, 1, 'x', 0, None),
-            0, 0))
+        conv = optpgen._NoOpConverter()
+        children = []
+        self.assertEqual('x', conv.convert(self.grammar, 1, 'x', 0, None))
+        self.assertIs(children, conv.convert(self.grammar, 256, None, 0,
+                                             children))
+        self.assertEqual((1, 1), (conv.tokens, conv.nodes))
+        with self.assertRaises(TypeError):
+            conv.convert(self.grammar, 'NAME', 'x', 0, None)
 
 
 class ErrorTest(OptpgenTestBase):
