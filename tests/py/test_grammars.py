@@ -4,10 +4,12 @@ Each logical line of a standard library is parsed alone, with the completion
 tokens the analyzer feeds for incomplete lines, by lib2to3's pure-Python pgen
 parser under the grammar of the matching version. Lines of files the matching
 interpreter accepts must parse; in files its parser rejects, the offending
-line must fail too.
+line must fail too. Lines with one random edit (a token dropped, repeated,
+swapped or inserted) must parse exactly when the interpreter's own parser
+accepts them.
 
-Run as a script (python -m tests.py.test_grammars) for the counts over the
-whole corpora.
+Run as a script (python -m tests.py.test_grammars --report) for the counts
+over the whole corpora.
 """
 
 import codecs
@@ -776,6 +778,13 @@ def _Parses(grammar, toks):
 
 
 class GrammarFileTest(unittest.TestCase):
+
+    def testFoundWhereTheAnalyzerLooks(self):
+        from pysource import config
+        for version in kVersions:
+            path = config.GetLoomFilename(
+                'resources/pgen-grammars/Python-Grammar-' + version)
+            self.assertTrue(os.path.isfile(path), path)
 
     def testStartSymbolIsFileInput(self):
         for version in kVersions:
