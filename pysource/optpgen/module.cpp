@@ -80,6 +80,9 @@ extern "C" __attribute__((visibility("default"))) void initoptpgen() {
     Py_INCREF(optpgen::ParseErrorType);
     tl::requireStatus(
         PyModule_AddObject(M, "ParseError", optpgen::ParseErrorType));
+    Ref Api = require(PyCapsule_New(const_cast<optpgen::ParserApi *>(optpgen::parserApi()),
+                                    optpgen::kParserCapsuleName, nullptr));
+    tl::requireStatus(PyModule_AddObject(M, "_C_API", Api.release()));
     Ref Gen = require(PyImport_ImportModule("pysource._pgengen"));
     Ref Cls = require(PyObject_GetAttrString(Gen.get(), "ParserGenerator"));
     tl::requireStatus(PyModule_AddObject(M, "ParserGenerator", Cls.release()));

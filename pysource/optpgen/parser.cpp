@@ -497,6 +497,36 @@ PyObject *createParser(PyObject *, PyObject *Args, PyObject *Kw) {
   });
 }
 
+namespace {
+
+int apiSetup(PyObject *Self, int Start) {
+  return guard<int>(-1, [&] {
+    Ref S = require(PyInt_FromLong(Start));
+    Ref Args = require(PyTuple_Pack(1, S.get()));
+    require(parser_setup(Self, Args.get(), nullptr));
+    return 0;
+  });
+}
+
+int apiAddToken(PyObject *Self, int Type, PyObject *Value, PyObject *Context) {
+  return guard<int>(-1, [&] {
+    Ref T = require(PyInt_FromLong(Type));
+    Ref R = require(addToken(Self, T.get(), Value, Context));
+    return R.get() == Py_True ? 1 : 0;
+  });
+}
+
+PyObject *apiGetRootNode(PyObject *Self) { return parser_getrootnode(Self, nullptr); }
+
+} // namespace
+
+const ParserApi *parserApi() {
+  static ParserApi Api = {kParserApiVersion, &ParserType,    &NodeConverterType, nullptr,
+                          apiSetup,          apiAddToken,    apiGetRootNode};
+  Api.ParseError = ParseErrorType;
+  return &Api;
+}
+
 int initParser(PyObject *Module) {
   tl::TypeDesc D;
   D.Name = "pysource.optpgen.Parser";
