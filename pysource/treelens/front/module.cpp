@@ -96,9 +96,19 @@ void initModule() {
 
 } // namespace treelens
 
+// A failed start-up leaves no half-made module behind for the next import.
 extern "C" __attribute__((visibility("default"))) void inittreelens() {
-  tl::guard<int>(-1, [] {
-    treelens::initModule();
-    return 0;
-  });
+  if (tl::guard<int>(-1, [] {
+        treelens::initModule();
+        return 0;
+      }) == 0)
+    return;
+  PyObject *Type, *Value, *Tb;
+  PyErr_Fetch(&Type, &Value, &Tb);
+  PyObject *Modules = PyImport_GetModuleDict();
+  const char *Name = treelens::host::Host.Module ? PyModule_GetName(treelens::host::Host.Module) : nullptr;
+  if (Name && PyDict_GetItemString(Modules, Name))
+    PyDict_DelItemString(Modules, Name);
+  PyErr_Clear();
+  PyErr_Restore(Type, Value, Tb);
 }

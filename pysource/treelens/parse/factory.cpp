@@ -279,7 +279,9 @@ void discardNodes(PyObject *Node, int Depth) {
     PySys_WriteStdout("depth too great\n");
     return;
   }
-  NodeObject *N = asNode(Node);
+  if (!isNode(Node))
+    asNode(Node);
+  NodeObject *N = reinterpret_cast<NodeObject *>(Node);
   pushFree(N);
   if (!N->Children)
     return;

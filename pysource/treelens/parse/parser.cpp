@@ -122,7 +122,7 @@ struct LogicalSource {
   host::LogicalLineObject *L;
   Py_ssize_t count() const { return L->TokenCount; }
   PyObject *text(Py_ssize_t I) const {
-    PyObject *T = host::logicalTokenText(L, I);
+    PyObject *T = L->Texts[I] ? L->Texts[I] : Py_None;
     tl::expectType(PyString_Check(T), "bytes", T);
     return T;
   }
