@@ -73,15 +73,16 @@ extern "C" __attribute__((visibility("default"))) void initoptpgen() {
   if (!M)
     return;
   guard(0, [&] {
-    if (optpgen::initTables() < 0 || optpgen::initConverters(M) < 0 ||
-        optpgen::initParser(M) < 0)
-      throw tl::PyErrSet();
     optpgen::ParseErrorType = makeParseError();
     Py_INCREF(optpgen::ParseErrorType);
     tl::requireStatus(
         PyModule_AddObject(M, "ParseError", optpgen::ParseErrorType));
-    Ref Api = require(PyCapsule_New(const_cast<optpgen::ParserApi *>(optpgen::parserApi()),
-                                    optpgen::kParserCapsuleName, nullptr));
+    if (optpgen::initTables() < 0 || optpgen::initConverters(M) < 0 ||
+        optpgen::initParser(M) < 0)
+      throw tl::PyErrSet();
+    Ref Api = require(
+        PyCapsule_New(const_cast<optpgen::ParserApi *>(optpgen::parserApi()),
+                      optpgen::kParserCapsuleName, nullptr));
     tl::requireStatus(PyModule_AddObject(M, "_C_API", Api.release()));
     Ref Gen = require(PyImport_ImportModule("pysource._pgengen"));
     Ref Cls = require(PyObject_GetAttrString(Gen.get(), "ParserGenerator"));

@@ -325,6 +325,29 @@ PyObject *parser_addtoken(PyObject *Self, PyObject *Args, PyObject *Kw) {
   });
 }
 
+/// Starts a new input at Symbol (the grammar's start when None); throws
+/// PyErrSet.
+void setupParser(PyObject *Self, PyObject *Start) {
+  ParserImpl &P = impl(Self);
+  if (!P.Grammar)
+    tl::raise(PyExc_RuntimeError, msg::NotReady);
+  long Symbol = P.Tables->startSymbol();
+  if (Start != Py_None) {
+    Symbol = PyInt_AsLong(Start);
+    if (Symbol == -1 && PyErr_Occurred())
+      throw tl::PyErrSet();
+  }
+  BusyScope Busy(P);
+  P.clearTree();
+  P.Native = P.Raw ? nullptr : nativeConvertOf(P.Converter);
+  if (Symbol < pgen::FirstSymbol || Symbol > 0x7fffffffL ||
+      !P.Driver.setup(static_cast<int>(Symbol)))
+    tl::raiseFormat(PyExc_ValueError, msg::UnknownStart, Symbol);
+  Py_INCREF(Py_None);
+  P.Frames.push_back(
+      NodeFrame{static_cast<int>(Symbol), Py_None, nullptr, nullptr});
+}
+
 PyObject *parser_setup(PyObject *Self, PyObject *Args, PyObject *Kw) {
   return guard<PyObject *>(nullptr, [&]() -> PyObject * {
     PyObject *Start = Py_None;
@@ -332,24 +355,7 @@ PyObject *parser_setup(PyObject *Self, PyObject *Args, PyObject *Kw) {
     if (!PyArg_ParseTupleAndKeywords(Args, Kw, "|O:setup",
                                      const_cast<char **>(Names), &Start))
       throw tl::PyErrSet();
-    ParserImpl &P = impl(Self);
-    if (!P.Grammar)
-      tl::raise(PyExc_RuntimeError, msg::NotReady);
-    long Symbol = P.Tables->startSymbol();
-    if (Start != Py_None) {
-      Symbol = PyInt_AsLong(Start);
-      if (Symbol == -1 && PyErr_Occurred())
-        throw tl::PyErrSet();
-    }
-    BusyScope Busy(P);
-    P.clearTree();
-    P.Native = P.Raw ? nullptr : nativeConvertOf(P.Converter);
-    if (Symbol < pgen::FirstSymbol || Symbol > 0x7fffffffL ||
-        !P.Driver.setup(static_cast<int>(Symbol)))
-      tl::raiseFormat(PyExc_ValueError, msg::UnknownStart, Symbol);
-    Py_INCREF(Py_None);
-    P.Frames.push_back(
-        NodeFrame{static_cast<int>(Symbol), Py_None, nullptr, nullptr});
+    setupParser(Self, Start);
     Py_RETURN_NONE;
   });
 }
@@ -466,8 +472,7 @@ PyObject *feedTokens(PyObject *, PyObject *Args) {
     if (!PyArg_ParseTuple(Args, "O!O:_FeedTokens", &ParserType, &Self, &Tokens))
       throw tl::PyErrSet();
     Ref Seq = require(PySequence_Fast(Tokens, "tokens must be a sequence"));
-    Ref NoArgs = require(PyTuple_New(0));
-    require(parser_setup(Self, NoArgs.get(), nullptr));
+    setupParser(Self, Py_None);
     Ref Result = Ref::borrow(Py_False);
     for (Py_ssize_t I = 0, N = PySequence_Fast_GET_SIZE(Seq.get()); I < N;
          ++I) {
@@ -499,30 +504,41 @@ PyObject *createParser(PyObject *, PyObject *Args, PyObject *Kw) {
 
 namespace {
 
+void expectParser(PyObject *O) {
+  tl::expectType(PyObject_TypeCheck(O, &ParserType), "Parser", O);
+}
+
 int apiSetup(PyObject *Self, int Start) {
-  return guard<int>(-1, [&] {
-    Ref S = require(PyInt_FromLong(Start));
-    Ref Args = require(PyTuple_Pack(1, S.get()));
-    require(parser_setup(Self, Args.get(), nullptr));
+  return guard(-1, [&] {
+    expectParser(Self);
+    Ref StartObj = require(PyInt_FromLong(Start));
+    setupParser(Self, StartObj.get());
     return 0;
   });
 }
 
 int apiAddToken(PyObject *Self, int Type, PyObject *Value, PyObject *Context) {
-  return guard<int>(-1, [&] {
-    Ref T = require(PyInt_FromLong(Type));
-    Ref R = require(addToken(Self, T.get(), Value, Context));
-    return R.get() == Py_True ? 1 : 0;
+  return guard(-1, [&] {
+    expectParser(Self);
+    Ref TypeObj = require(PyInt_FromLong(Type));
+    Ref Result = require(addToken(Self, TypeObj.get(), Value, Context));
+    return Result.get() == Py_True ? 1 : 0;
   });
 }
 
-PyObject *apiGetRootNode(PyObject *Self) { return parser_getrootnode(Self, nullptr); }
+PyObject *apiGetRootNode(PyObject *Self) {
+  return guard<PyObject *>(nullptr, [&] {
+    expectParser(Self);
+    return parser_getrootnode(Self, nullptr);
+  });
+}
 
 } // namespace
 
 const ParserApi *parserApi() {
-  static ParserApi Api = {kParserApiVersion, &ParserType,    &NodeConverterType, nullptr,
-                          apiSetup,          apiAddToken,    apiGetRootNode};
+  static ParserApi Api = {kParserApiVersion, &ParserType, &NodeConverterType,
+                          nullptr,           apiSetup,    apiAddToken,
+                          apiGetRootNode};
   Api.ParseError = ParseErrorType;
   return &Api;
 }
@@ -546,8 +562,7 @@ int initParser(PyObject *Module) {
   D.WeakListOffset = offsetof(ParserObject, WeakRefs);
   if (tl::readyType(ParserType, D) < 0)
     return -1;
-  if (PyModule_AddIntConstant(Module, "kMaxDepth",
-                              pgen::MaxParseDepth) < 0)
+  if (PyModule_AddIntConstant(Module, "kMaxDepth", pgen::MaxParseDepth) < 0)
     return -1;
   return tl::addType(Module, "Parser", ParserType);
 }

@@ -362,6 +362,55 @@ class ErrorTest(OptpgenTestBase):
         self.assertTrue(issubclass(optpgen.ParseError, Exception))
 
 
+class CApiTest(OptpgenTestBase):
+    """The ParserApi capsule, called through ctypes as a native driver would."""
+
+    def Api(self):
+        import ctypes
+        obj = ctypes.py_object
+        get = ctypes.pythonapi.PyCapsule_GetPointer
+        get.restype = ctypes.c_void_p
+        get.argtypes = [obj, ctypes.c_char_p]
+
+        class ParserApi(ctypes.Structure):
+            _fields_ = [
+                ('Version', ctypes.c_int),
+                ('ParserType', ctypes.c_void_p),
+                ('NodeConverterType', ctypes.c_void_p),
+                ('ParseError', obj),
+                ('Setup', ctypes.PYFUNCTYPE(ctypes.c_int, obj, ctypes.c_int)),
+                ('AddToken', ctypes.PYFUNCTYPE(ctypes.c_int, obj, ctypes.c_int,
+                                               obj, obj)),
+                ('GetRootNode', ctypes.PYFUNCTYPE(obj, obj)),
+            ]
+        ptr = get(optpgen._C_API, 'pysource.optpgen._C_API')
+        return ParserApi.from_address(ptr)
+
+    def testEntryPoints(self):
+        api = self.Api()
+        self.assertEqual((1, optpgen.ParseError),
+                         (api.Version, api.ParseError))
+        p = optpgen.CreateParser(self.grammar, None, True)
+        self.assertEqual(0, api.Setup(p, self.sym['start']))
+        results = [api.AddToken(p, t, v, c) for t, v, c in kAssign]
+        self.assertEqual([0] * 6 + [1], results)
+        expected = optpgen.CreateParser(self.grammar, None, True)
+        Feed(expected, kAssign)
+        self.assertEqual(expected.getrootnode(), api.GetRootNode(p))
+        api.Setup(p, self.sym['start'])
+        api.AddToken(p, NAME, 'x', 0)
+        with self.assertRaises(optpgen.ParseError) as ctx:
+            api.AddToken(p, NAME, 'y', 1)
+        self.assertEqual(('bad input', 1), (ctx.exception.msg,
+                                            ctx.exception.context))
+        with self.assertRaises(ValueError):
+            api.Setup(p, 3)
+        with self.assertRaises(TypeError):
+            api.AddToken(self.grammar, NAME, 'x', 0)
+        with self.assertRaises(TypeError):
+            api.GetRootNode(None)
+
+
 class GrammarTablesTest(OptpgenTestBase):
 
     def testTablesBuiltOncePerGrammar(self):
