@@ -4,7 +4,10 @@
 // object's NativeConvert field (typically in tp_new). The parser calls it
 // directly, with no Python method lookup, unless the object's type defines a
 // Python-level `convert` that overrides NodeConverter.convert; then it calls
-// that method with (grammar, node_type, value, context, children).
+// that method with (grammar, node_type, value, context, children). A
+// `convert` method that a static (C-level) type defines in its method table
+// is taken to do what its NativeConvert does and is not an override. The
+// type lookup is made when the parser is created and at each setup().
 #ifndef TREELENS_OPTPGEN_API_H
 #define TREELENS_OPTPGEN_API_H
 
