@@ -99,6 +99,14 @@ PyObject *noop_new(PyTypeObject *Type, PyObject *Args, PyObject *Kw) {
   return Self;
 }
 
+/// Its own convert entry (the base one's code), as a native converter type
+/// defines it: the parser still calls the slot directly.
+PyMethodDef NoOpMethods[] = {
+    {"convert", converter_convert, METH_VARARGS,
+     "convert(grammar, node_type, value, context, children) -> text, "
+     "children or None"},
+    {nullptr, nullptr, 0, nullptr}};
+
 PyMemberDef NoOpMembers[] = {
     {const_cast<char *>("tokens"), T_LONG, offsetof(NoOpConverterObject, Tokens),
      READONLY, const_cast<char *>("tokens converted so far")},
@@ -152,6 +160,7 @@ int initConverters(PyObject *Module) {
   N.Size = sizeof(NoOpConverterObject);
   N.Base = &NodeConverterType;
   N.Members = NoOpMembers;
+  N.Methods = NoOpMethods;
   N.New = noop_new;
   if (tl::readyType(NoOpConverterType, N) < 0)
     return -1;

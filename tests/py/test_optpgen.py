@@ -181,6 +181,8 @@ class TreeTest(OptpgenTestBase):
 class ConverterPathTest(OptpgenTestBase):
 
     def testNativeSlotAndOverrides(self):
+        self.assertIn('convert', optpgen._NoOpConverter.__dict__)
+
         class Plain(optpgen._NoOpConverter):
             pass
 
@@ -196,6 +198,7 @@ class ConverterPathTest(OptpgenTestBase):
             def convert(self, grammar, node_type, value, context, children):
                 return node_type
         cases = [
+            # _NoOpConverter defines convert in C: no override.
             ('native', optpgen._NoOpConverter(), True),
             ('native dropping', optpgen._NoOpConverter(drop=True), True),
             ('subclass without convert', Plain(), True),
