@@ -41,10 +41,12 @@ def InAsyncDef(logical):
     return False
 
 
-def Analyze(analyzer, text, async_scopes):
+def Analyze(analyzer, text, async_scopes, counts):
     """(logical, result) of every logical line of text whose result is not None."""
     failed = []
-    for logical in GetLogicalsFromText(text):
+    logicals = GetLogicalsFromText(text)
+    counts.append(len(logicals))
+    for logical in logicals:
         in_async = async_scopes and InAsyncDef(logical)
         result = analyzer.AnalyzeSingleLogical(logical, in_async)
         if result is not None:
@@ -100,10 +102,10 @@ class Corpus27Test(unittest.TestCase):
     def testStdlib(self):
         analyzer = tl.CPGenAnalyzerImpl((2, 7, 0), tl.kPy2DefaultGrammar, None, False)
         files = support.CorpusFiles('2.7')
-        wrong, print_calls, rejected_files = [], 0, 0
+        wrong, print_calls, rejected_files, counts = [], 0, 0, []
         for path in files:
             text = support.ReadBytes(path)
-            failed = Analyze(analyzer, text, False)
+            failed = Analyze(analyzer, text, False, counts)
             if Compiles27(text):
                 for logical, result in failed:
                     if UsesPrintFunction(text, logical):
@@ -113,8 +115,9 @@ class Corpus27Test(unittest.TestCase):
                 continue
             rejected_files += 1
             wrong.extend(Describe(path, l, r) for l, r in failed if Compiles27(CompletedSource(l)))
-        sys.stderr.write('\n2.7 corpus: %d files (%d rejected by CPython), %d lines disagree, %d print '
-                         'calls under print_function\n' % (len(files), rejected_files, len(wrong), print_calls))
+        sys.stderr.write('\n2.7 corpus: %d files (%d rejected by CPython), %d logical lines, %d disagree, %d '
+                         'print calls under print_function\n'
+                         % (len(files), rejected_files, sum(counts), len(wrong), print_calls))
         self.assertEqual(wrong[:40], [])
 
 
@@ -127,17 +130,17 @@ class Corpus36Test(unittest.TestCase):
         analyzer = tl.CPGenAnalyzerImpl((3, 6, 0), 'Python-Grammar-3.6', None, True)
         texts = [(path, support.ReadBytes(path)) for path in files]
         compiling = OracleCompiles('3.6', texts)
-        wrong, suspects = [], []
+        wrong, suspects, counts = [], [], []
         for path, text in texts:
-            for logical, result in Analyze(analyzer, text, True):
+            for logical, result in Analyze(analyzer, text, True, counts):
                 if path in compiling:
                     wrong.append(Describe(path, logical, result))
                 else:
                     suspects.append((len(suspects), (path, logical, result)))
         accepted = OracleCompiles('3.6', [(i, CompletedSource(l)) for i, (_, l, _) in suspects])
         wrong.extend(Describe(*item) for i, item in suspects if i in accepted)
-        sys.stderr.write('\n3.6 corpus: %d files (%d rejected by CPython), %d lines disagree\n'
-                         % (len(texts), len(texts) - len(compiling), len(wrong)))
+        sys.stderr.write('\n3.6 corpus: %d files (%d rejected by CPython), %d logical lines, %d disagree\n'
+                         % (len(texts), len(texts) - len(compiling), sum(counts), len(wrong)))
         self.assertEqual(wrong[:40], [])
 
 
