@@ -5,7 +5,9 @@
 #include "pysource/treelens/fstrings/fstrings.h"
 #include "pysource/treelens/hints/hints.h"
 #include "pysource/treelens/host/host.h"
+#include "pysource/treelens/nodes/args.h"
 #include "pysource/treelens/nodes/records.h"
+#include "pysource/treelens/nodes/utils.h"
 #include "pysource/treelens/walker/walker.h"
 
 namespace treelens {
@@ -90,6 +92,8 @@ void initModule() {
   addFunctions(Module, SyntaxErrorFunctions);
   addFunctions(Module, host::RecordFunctions);
   addFunctions(Module, host::SymbolInfoFunctions);
+  addFunctions(Module, NodeUtilFunctions);
+  addFunctions(Module, ArgListFunctions);
 }
 
 } // namespace

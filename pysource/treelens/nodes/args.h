@@ -19,9 +19,9 @@ struct ParameterDefOps : NodeOps {
 
 /// CSingleUsedArgumentNode: slots 6 to 9.
 struct UsedArgumentOps : NodeOps {
-  virtual tl::Ref getPrefix(NodeObject *N) const; ///< "*" / "**" text or Py_None
-  virtual tl::Ref getName(NodeObject *N) const;   ///< keyword name node or Py_None
-  virtual tl::Ref getValue(NodeObject *N) const;  ///< value node (the node itself unless keyword)
+  virtual tl::Ref getPrefix(NodeObject *N) const;             ///< "*" / "**" text or Py_None
+  virtual tl::Ref getName(NodeObject *N) const;               ///< keyword name node or Py_None
+  virtual tl::Ref getValue(NodeObject *N) const;              ///< value node (the node itself unless keyword)
   virtual bool isUnparenthesizedGenExpr(NodeObject *N) const; ///< never raises
 };
 
@@ -50,9 +50,6 @@ TL_HIDDEN tl::Ref getUsedArgInfoList(PyObject *Node);
 /// CFunctionParameterDef, CSingleUsedArgumentNode), for the class table.
 TL_HIDDEN const NodeOps *argsClassOps(NodeClass C);
 TL_HIDDEN PyMethodDef *argsClassMethods(NodeClass C);
-
-/// Interns the method names native callers look up. Throws PyErrSet.
-TL_HIDDEN void initArgsNames();
 
 /// Module functions GetDefiningArgInfoList and GetUsedArgInfoList.
 TL_HIDDEN extern PyMethodDef ArgListFunctions[];

@@ -1,6 +1,9 @@
 // The node class tree: one row per class, with the grammar rules each class represents.
 #include "pysource/treelens/nodes/classtable.h"
 
+#include "pysource/treelens/nodes/args.h"
+#include "pysource/treelens/nodes/expr.h"
+
 namespace treelens {
 
 namespace {
@@ -46,6 +49,14 @@ using C = NodeClass;
 #define TL_NODE(Cls, Base, Doc, Rules, Final)                                                      \
   NodeClassRow { C::Cls, C::Base, #Cls, "pysource.treelens." #Cls, Doc, Rules, Final, nullptr, nullptr }
 
+/// A row whose class has its own operations: Methods and Ops from Source
+/// (exprClass or argsClass), looked up by the class.
+#define TL_NODE_OPS(Cls, Base, Doc, Rules, Final, Source)                                                    \
+  NodeClassRow {                                                                                             \
+    C::Cls, C::Base, #Cls, "pysource.treelens." #Cls, Doc, Rules, Final, Source##Methods(C::Cls),            \
+        Source##Ops(C::Cls)                                                                                  \
+  }
+
 } // namespace
 
 const std::vector<NodeClassRow> &nodeClassRows() {
@@ -59,27 +70,31 @@ const std::vector<NodeClassRow> &nodeClassRows() {
               nullptr, false),
       TL_NODE(CStmt, CNode, "Base class for statements.", nullptr, false),
       TL_NODE(CExpression, CNode, "Base class for all expressions", nullptr, false),
-      TL_NODE(CAtom, CExpression, "Bracketed atom or a run of adjacent string literals.", nullptr, false),
+      TL_NODE_OPS(CAtom, CExpression, "Bracketed atom or a run of adjacent string literals.", nullptr, false,
+                  exprClass),
       TL_NODE(CBinaryExpression, CExpression, "Binary, boolean, comparison or conditional expression.",
               BinaryExpressionRules, false),
-      TL_NODE(CStarExpression, CExpression, "Star expression: '*' expr.", StarExpressionRules, false),
+      TL_NODE_OPS(CStarExpression, CExpression, "Star expression: '*' expr.", StarExpressionRules, false,
+                  exprClass),
       TL_NODE(CImportNamesStmt, CNode, "import statement: 'import' dotted names with 'as'.", nullptr, false),
       TL_NODE(CFromImportStmt, CNode, "from statement: 'from' module 'import' names.", nullptr, false),
-      TL_NODE(CSingleUsedArgumentNode, CNode,
-              "One call argument of more than one token: keyword, star or generator argument.", nullptr,
-              false),
-      TL_NODE(CFunctionParameterDef, CNode, "One parameter with an annotation, or a nested tuple parameter.",
-              FunctionParameterDefRules, false),
+      TL_NODE_OPS(CSingleUsedArgumentNode, CNode,
+                  "One call argument of more than one token: keyword, star or generator argument.", nullptr,
+                  false, argsClass),
+      TL_NODE_OPS(CFunctionParameterDef, CNode,
+                  "One parameter with an annotation, or a nested tuple parameter.", FunctionParameterDefRules,
+                  false, argsClass),
       TL_NODE(CDefiningArglistNode, CNode, "Parameter list of a def or lambda.", DefiningArglistRules, false),
       TL_NODE(CUsedArglistNode, CNode, "Argument list of a call, decorator or class statement.", nullptr,
               false),
-      TL_NODE(CParametersNode, CNode, "Parenthesised parameters after def NAME.", nullptr, false),
+      TL_NODE_OPS(CParametersNode, CNode, "Parenthesised parameters after def NAME.", nullptr, false,
+                  argsClass),
       TL_NODE(CClassdefStmt, CStmt, "class statement.", nullptr, false),
       TL_NODE(CFuncdefStmt, CStmt, "def statement.", nullptr, false),
       TL_NODE(CSingleDecorator, CNode, "One decorator line.", SingleDecoratorRules, false),
       TL_NODE(CDottedName, CExpression, "Dotted name: NAME ('.' NAME)*.", DottedNameRules, false),
       TL_NODE(CMultipleDecorators, CNode, "Two or more decorators.", MultipleDecoratorsRules, false),
-      TL_NODE(CLambdaExpr, CExpression, "lambda expression.", nullptr, false),
+      TL_NODE_OPS(CLambdaExpr, CExpression, "lambda expression.", nullptr, false, exprClass),
       TL_NODE(CGlobalStmt, CStmt, "global statement.", nullptr, false),
       TL_NODE(CNonlocalStmt, CStmt, "nonlocal statement.", nullptr, false),
       TL_NODE(CForStmt, CStmt, "for statement.", nullptr, false),
@@ -94,22 +109,27 @@ const std::vector<NodeClassRow> &nodeClassRows() {
       TL_NODE(CBinaryOp, CNode, "Binary operator.", nullptr, false),
       TL_NODE(CTestExpr, CExpression, "Test expression.", nullptr, false),
       TL_NODE(CReturnStmt, CStmt, "return statement.", nullptr, false),
-      TL_NODE(CYieldExpr, CExpression, "yield expression.", YieldExprRules, false),
-      TL_NODE(CYieldArg, CNode, "Python 3 yield argument: 'from' test.", YieldArgRules, false),
-      TL_NODE(CTestListStarExpr, CExpression,
-              "Comma-separated expression list, or an expression followed by a comprehension clause.",
-              TestListStarExprRules, false),
+      TL_NODE_OPS(CYieldExpr, CExpression, "yield expression.", YieldExprRules, false, exprClass),
+      TL_NODE_OPS(CYieldArg, CNode, "Python 3 yield argument: 'from' test.", YieldArgRules, false, exprClass),
+      TL_NODE_OPS(CTestListStarExpr, CExpression,
+                  "Comma-separated expression list, or an expression followed by a comprehension clause.",
+                  TestListStarExprRules, false, exprClass),
       TL_NODE(CNameLiteral, CExpression, "NAME token.", nullptr, false),
       TL_NODE(CKeywordLiteral, CExpression, "Keyword token (also the ASYNC and AWAIT tokens).", nullptr,
               false),
-      TL_NODE(CCompForNode, CNode, "Comprehension 'for' clause.", nullptr, false),
-      TL_NODE(CListmakerNode, CNode, "List display contents of the 2.7 grammar.", ListmakerRules, false),
-      TL_NODE(CTrailer, CNode, "Trailer: call arguments, subscript or attribute.", nullptr, false),
-      TL_NODE(CAtomExpr, CExpression, "atom_expr: [AWAIT] atom trailer*.", AtomExprRules, false),
-      TL_NODE(CPower, CExpression, "power: atom with trailers and an optional exponent.", PowerRules, true),
-      TL_NODE(CNumberLiteral, CExpression, "NUMBER token.", nullptr, false),
-      TL_NODE(CStringLiteral, CExpression, "STRING token.", nullptr, false),
-      TL_NODE(CFactorExpr, CExpression, "Unary '+', '-' or '~' applied to a factor.", nullptr, false),
+      TL_NODE_OPS(CCompForNode, CNode, "Comprehension 'for' clause.", nullptr, false, exprClass),
+      TL_NODE_OPS(CListmakerNode, CNode, "List display contents of the 2.7 grammar.", ListmakerRules, false,
+                  exprClass),
+      TL_NODE_OPS(CTrailer, CNode, "Trailer: call arguments, subscript or attribute.", nullptr, false,
+                  exprClass),
+      TL_NODE_OPS(CAtomExpr, CExpression, "atom_expr: [AWAIT] atom trailer*.", AtomExprRules, false,
+                  exprClass),
+      TL_NODE_OPS(CPower, CExpression, "power: atom with trailers and an optional exponent.", PowerRules,
+                  true, exprClass),
+      TL_NODE_OPS(CNumberLiteral, CExpression, "NUMBER token.", nullptr, false, exprClass),
+      TL_NODE_OPS(CStringLiteral, CExpression, "STRING token.", nullptr, false, exprClass),
+      TL_NODE_OPS(CFactorExpr, CExpression, "Unary '+', '-' or '~' applied to a factor.", nullptr, false,
+                  exprClass),
   };
   return Rows;
 }

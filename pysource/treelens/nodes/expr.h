@@ -25,8 +25,8 @@ struct AtomOps : ExpressionOps {
   /// Slot 8: "[", "{", "(" (the child's own text object) or Py_None;
   /// ValueError "Atom node with no children".
   virtual tl::Ref getInitialBracket(NodeObject *N) const;
-  virtual bool isLiteral(NodeObject *N) const;              ///< slot 9; never raises
-  virtual bool isComprehension(NodeObject *N) const;        ///< slot 10; throws
+  virtual bool isLiteral(NodeObject *N) const;               ///< slot 9; never raises
+  virtual bool isComprehension(NodeObject *N) const;         ///< slot 10; throws
   virtual bool isTwoPlusStringLiterals(NodeObject *N) const; ///< slot 11; never raises
 };
 
@@ -77,8 +77,8 @@ struct NumberLiteralOps : ExpressionOps {
 
 /// CStringLiteral: slots 8, 9.
 struct StringLiteralOps : ExpressionOps {
-  virtual bool isUnicode(NodeObject *N) const;               ///< never raises
-  virtual tl::Ref getStringContents(NodeObject *N) const;    ///< new bytes
+  virtual bool isUnicode(NodeObject *N) const;            ///< never raises
+  virtual tl::Ref getStringContents(NodeObject *N) const; ///< new bytes
 };
 
 /// CFactorExpr: slot 8.
@@ -118,7 +118,7 @@ struct TrailerOps : NodeOps {
 
 // CAtom (GetSubExpr / GetSubExprCount: exprGetSubExpr / exprGetSubExprCount of node.h)
 TL_HIDDEN tl::Ref atomGetInitialBracket(NodeObject *N);
-TL_HIDDEN bool atomIsLiteral(NodeObject *N);              ///< never raises
+TL_HIDDEN bool atomIsLiteral(NodeObject *N); ///< never raises
 TL_HIDDEN bool atomIsComprehension(NodeObject *N);
 TL_HIDDEN bool atomIsTwoPlusStringLiterals(NodeObject *N); ///< never raises
 // CStarExpression
@@ -166,10 +166,6 @@ TL_HIDDEN tl::Ref trailerGetInitialToken(NodeObject *N);
 /// The ops and Python methods of the expression classes, for the class table.
 TL_HIDDEN const NodeOps *exprClassOps(NodeClass C);
 TL_HIDDEN PyMethodDef *exprClassMethods(NodeClass C);
-
-/// Interns the method names native callers look up; called once before the
-/// node classes are created. Throws PyErrSet.
-TL_HIDDEN void initExprNames();
 
 } // namespace treelens
 
