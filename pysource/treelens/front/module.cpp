@@ -7,6 +7,8 @@
 #include "pysource/treelens/host/host.h"
 #include "pysource/treelens/nodes/args.h"
 #include "pysource/treelens/nodes/records.h"
+#include "pysource/treelens/nodes/stmt.h"
+#include "pysource/treelens/nodes/totext.h"
 #include "pysource/treelens/nodes/utils.h"
 #include "pysource/treelens/walker/walker.h"
 
@@ -81,6 +83,7 @@ void initModule() {
   tl::requireStatus(initClassInfoType(Module));
   tl::requireStatus(initNodeTypes(Module));
   tl::requireStatus(initNodeRecordTypes(Module));
+  tl::requireStatus(initNodeToTextType(Module));
   tl::requireStatus(initFactoryType(Module));
   tl::requireStatus(walker::initWalkerTypes(Module));
   tl::requireStatus(initAnalyzerBaseType(Module));
@@ -94,6 +97,7 @@ void initModule() {
   addFunctions(Module, host::SymbolInfoFunctions);
   addFunctions(Module, NodeUtilFunctions);
   addFunctions(Module, ArgListFunctions);
+  addFunctions(Module, StmtFunctions);
 }
 
 } // namespace

@@ -3,6 +3,7 @@
 
 #include "pysource/treelens/nodes/args.h"
 #include "pysource/treelens/nodes/expr.h"
+#include "pysource/treelens/nodes/stmt.h"
 
 namespace treelens {
 
@@ -50,7 +51,7 @@ using C = NodeClass;
   NodeClassRow { C::Cls, C::Base, #Cls, "pysource.treelens." #Cls, Doc, Rules, Final, nullptr, nullptr }
 
 /// A row whose class has its own operations: Methods and Ops from Source
-/// (exprClass or argsClass), looked up by the class.
+/// (exprClass, argsClass or stmtClass), looked up by the class.
 #define TL_NODE_OPS(Cls, Base, Doc, Rules, Final, Source)                                                    \
   NodeClassRow {                                                                                             \
     C::Cls, C::Base, #Cls, "pysource.treelens." #Cls, Doc, Rules, Final, Source##Methods(C::Cls),            \
@@ -76,8 +77,10 @@ const std::vector<NodeClassRow> &nodeClassRows() {
               BinaryExpressionRules, false),
       TL_NODE_OPS(CStarExpression, CExpression, "Star expression: '*' expr.", StarExpressionRules, false,
                   exprClass),
-      TL_NODE(CImportNamesStmt, CNode, "import statement: 'import' dotted names with 'as'.", nullptr, false),
-      TL_NODE(CFromImportStmt, CNode, "from statement: 'from' module 'import' names.", nullptr, false),
+      TL_NODE_OPS(CImportNamesStmt, CNode, "import statement: 'import' dotted names with 'as'.", nullptr,
+                  false, stmtClass),
+      TL_NODE_OPS(CFromImportStmt, CNode, "from statement: 'from' module 'import' names.", nullptr, false,
+                  stmtClass),
       TL_NODE_OPS(CSingleUsedArgumentNode, CNode,
                   "One call argument of more than one token: keyword, star or generator argument.", nullptr,
                   false, argsClass),
@@ -89,26 +92,27 @@ const std::vector<NodeClassRow> &nodeClassRows() {
               false),
       TL_NODE_OPS(CParametersNode, CNode, "Parenthesised parameters after def NAME.", nullptr, false,
                   argsClass),
-      TL_NODE(CClassdefStmt, CStmt, "class statement.", nullptr, false),
-      TL_NODE(CFuncdefStmt, CStmt, "def statement.", nullptr, false),
-      TL_NODE(CSingleDecorator, CNode, "One decorator line.", SingleDecoratorRules, false),
+      TL_NODE_OPS(CClassdefStmt, CStmt, "class statement.", nullptr, false, stmtClass),
+      TL_NODE_OPS(CFuncdefStmt, CStmt, "def statement.", nullptr, false, stmtClass),
+      TL_NODE_OPS(CSingleDecorator, CNode, "One decorator line.", SingleDecoratorRules, false, stmtClass),
       TL_NODE(CDottedName, CExpression, "Dotted name: NAME ('.' NAME)*.", DottedNameRules, false),
       TL_NODE(CMultipleDecorators, CNode, "Two or more decorators.", MultipleDecoratorsRules, false),
       TL_NODE_OPS(CLambdaExpr, CExpression, "lambda expression.", nullptr, false, exprClass),
-      TL_NODE(CGlobalStmt, CStmt, "global statement.", nullptr, false),
-      TL_NODE(CNonlocalStmt, CStmt, "nonlocal statement.", nullptr, false),
-      TL_NODE(CForStmt, CStmt, "for statement.", nullptr, false),
-      TL_NODE(CWithStmt, CStmt, "with statement.", nullptr, false),
-      TL_NODE(CWithItem, CNode, "with item with 'as': expression 'as' target.", nullptr, false),
+      TL_NODE_OPS(CGlobalStmt, CStmt, "global statement.", nullptr, false, stmtClass),
+      TL_NODE_OPS(CNonlocalStmt, CStmt, "nonlocal statement.", nullptr, false, stmtClass),
+      TL_NODE_OPS(CForStmt, CStmt, "for statement.", nullptr, false, stmtClass),
+      TL_NODE_OPS(CWithStmt, CStmt, "with statement.", nullptr, false, stmtClass),
+      TL_NODE_OPS(CWithItem, CNode, "with item with 'as': expression 'as' target.", nullptr, false,
+                  stmtClass),
       TL_NODE(CPassStmt, CStmt, "pass statement.", nullptr, false),
-      TL_NODE(CExceptClause, CNode, "except clause.", ExceptClauseRules, false),
-      TL_NODE(CExprStmt, CStmt, "Expression statement: assignments, augmented assignments, annotations.",
-              nullptr, false),
-      TL_NODE(CAnnotatedAssignNode, CNode, "Annotation part of an expression statement.",
-              AnnotatedAssignRules, false),
+      TL_NODE_OPS(CExceptClause, CNode, "except clause.", ExceptClauseRules, false, stmtClass),
+      TL_NODE_OPS(CExprStmt, CStmt, "Expression statement: assignments, augmented assignments, annotations.",
+                  nullptr, false, stmtClass),
+      TL_NODE_OPS(CAnnotatedAssignNode, CNode, "Annotation part of an expression statement.",
+                  AnnotatedAssignRules, false, stmtClass),
       TL_NODE(CBinaryOp, CNode, "Binary operator.", nullptr, false),
       TL_NODE(CTestExpr, CExpression, "Test expression.", nullptr, false),
-      TL_NODE(CReturnStmt, CStmt, "return statement.", nullptr, false),
+      TL_NODE_OPS(CReturnStmt, CStmt, "return statement.", nullptr, false, stmtClass),
       TL_NODE_OPS(CYieldExpr, CExpression, "yield expression.", YieldExprRules, false, exprClass),
       TL_NODE_OPS(CYieldArg, CNode, "Python 3 yield argument: 'from' test.", YieldArgRules, false, exprClass),
       TL_NODE_OPS(CTestListStarExpr, CExpression,

@@ -1,4 +1,4 @@
-// CAsName and CArgInfo records, and the CNodeToTextConverter class object.
+// CAsName and CArgInfo records.
 #include "pysource/treelens/nodes/records.h"
 
 #include "fieldpickle.h"
@@ -12,7 +12,6 @@ namespace {
 
 PyTypeObject AsNameType;
 PyTypeObject ArgInfoType;
-PyTypeObject NodeToTextConverterType;
 
 int asname_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
   static const char *Keywords[] = {nullptr};
@@ -180,14 +179,6 @@ int initNodeRecordTypes(PyObject *Module) {
                         {"type_expr", F::Object, offsetof(ArgInfoObject, TypeExpr), &cnodeType()}},
                        host::Host.UnpickleFields);
 
-    D = tl::TypeDesc();
-    D.Name = "pysource.treelens.CNodeToTextConverter";
-    D.Doc = "Renders expression nodes back to source text.";
-    D.Size = sizeof(PyObject);
-    D.New = PyType_GenericNew;
-    tl::requireStatus(tl::readyType(NodeToTextConverterType, D));
-    tl::requireStatus(tl::addType(Module, "CNodeToTextConverter", NodeToTextConverterType));
-    tl::registerPickle(NodeToTextConverterType, {}, host::Host.UnpickleFields);
     return 0;
   });
 }

@@ -25,7 +25,7 @@ struct ArgInfoObject {
 TL_HIDDEN PyTypeObject &asNameType();
 TL_HIDDEN PyTypeObject &argInfoType();
 
-/// Readies CAsName, CArgInfo and CNodeToTextConverter; -1 on failure.
+/// Readies CAsName and CArgInfo; -1 on failure.
 TL_HIDDEN int initNodeRecordTypes(PyObject *Module);
 
 } // namespace treelens
