@@ -387,6 +387,21 @@ class ParserTest(unittest.TestCase):
         # The parser is usable again after an error.
         self.assertEqual(Leaves(Parse('2.7', b'y\n')), [b'y'])
 
+    def testConvertAndCollection(self):
+        parser = Parser('2.7')
+        leaf = parser.convert(None, 1, b'x', 4, None)
+        self.assertEqual((type(leaf), leaf.fText, leaf.fContext), (tl.CNameLiteral, b'x', 4))
+        # Analyzers, parsers and factories hold cycles through the engine: the collector frees them.
+        kinds = (tl.CPGenAnalyzerImpl, tl.CPGenParserImpl, tl.CNodeFactory)
+
+        def Count():
+            gc.collect()
+            return sum(1 for o in gc.get_objects() if type(o) in kinds)
+        before = Count()
+        for _ in range(3):
+            tl.CPGenAnalyzerImpl((3, 6, 0)).AnalyzeSingleLogical(Logical(b'x = 1\n'), False)
+        self.assertEqual(Count(), before)
+
     def testConstructorChecks(self):
         with self.assertRaises(TypeError) as cm:
             tl.CPGenParserImpl([3, 6, 0], 'Python-Grammar-3.6')
