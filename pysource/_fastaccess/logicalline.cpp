@@ -5,6 +5,7 @@
 #include "typedesc.h"
 
 #include <stddef.h>
+#include <cstring>
 #include <structmember.h>
 
 namespace fastaccess {
@@ -118,6 +119,13 @@ int logical_clear(PyObject *O) {
   return 0;
 }
 
+/// Dead exact records kept for reuse by the splitter, linked through
+/// ParentScope. Invariant: FreeCount of them, each untracked with every
+/// owned field cleared.
+LogicalLineObject *FreeList = nullptr;
+int FreeCount = 0;
+constexpr int kMaxFree = 4096;
+
 void logical_dealloc(PyObject *O) {
   LogicalLineObject *L = self(O);
   PyObject_GC_UnTrack(O);
@@ -128,7 +136,13 @@ void logical_dealloc(PyObject *O) {
   logical_clear(O);
   freeTokens(L);
   Py_CLEAR(L->LineText);
-  Py_TYPE(O)->tp_free(O);
+  if (Py_TYPE(O) == &LogicalLineType && FreeCount < kMaxFree) {
+    L->ParentScope = reinterpret_cast<PyObject *>(FreeList);
+    FreeList = L;
+    ++FreeCount;
+  } else {
+    Py_TYPE(O)->tp_free(O);
+  }
   Py_TRASHCAN_SAFE_END(O)
 }
 
@@ -435,16 +449,38 @@ void TokenArrays::moveInto(LogicalLineObject *L) {
 
 LogicalLineObject *newLogical(TokenArrays &A, int Kind, long FirstLine, long Indent,
                               Ref LineText) {
-  PyObject *O = LogicalLineType.tp_alloc(&LogicalLineType, 0);
-  if (!O)
-    throw tl::PyErrSet();
-  LogicalLineObject *L = self(O);
+  LogicalLineObject *L = FreeList;
+  if (L) {
+    FreeList = reinterpret_cast<LogicalLineObject *>(L->ParentScope);
+    --FreeCount;
+    std::memset(reinterpret_cast<char *>(L) + sizeof(PyObject), 0,
+                sizeof(LogicalLineObject) - sizeof(PyObject));
+    _Py_NewReference(reinterpret_cast<PyObject *>(L));
+    PyObject_GC_Track(L);
+  } else {
+    PyObject *O = LogicalLineType.tp_alloc(&LogicalLineType, 0);
+    if (!O)
+      throw tl::PyErrSet();
+    L = self(O);
+  }
   A.moveInto(L);
   L->Kind = Kind;
   L->FirstLine = FirstLine;
   L->Indent = Indent;
   L->LineText = LineText.release();
   return L;
+}
+
+int clearLogicalFreeList() {
+  int N = FreeCount;
+  while (FreeList) {
+    LogicalLineObject *L = FreeList;
+    FreeList = reinterpret_cast<LogicalLineObject *>(L->ParentScope);
+    L->ParentScope = nullptr;
+    PyObject_GC_Del(L);
+  }
+  FreeCount = 0;
+  return N;
 }
 
 int initLogicalLineType() {

@@ -1,5 +1,6 @@
 // Module pysource._fastaccess: record operations, tokenizer functions and the native API capsule.
 #include "pysource/_fastaccess/internal.h"
+#include "pysource/_fastaccess/records.h"
 
 #include "typedesc.h"
 
@@ -102,6 +103,10 @@ PyObject *f_find_string_end(PyObject *, PyObject *Args) {
   });
 }
 
+PyObject *f_clear_free_list(PyObject *, PyObject *) {
+  return PyInt_FromLong(clearLogicalFreeList());
+}
+
 PyMethodDef Functions[] = {
     {"ClearLogicalDerivedInfo", f_clear, METH_O,
      "ClearLogicalDerivedInfo(logical): empties the derived-info lists."},
@@ -121,6 +126,8 @@ PyMethodDef Functions[] = {
      "The offset just past the string literal that starts at pos (its prefix or\n"
      "opening quote), or len(text) when it is unterminated. Quotes inside f-string\n"
      "replacement fields do not nest. ValueError when no literal starts at pos."},
+    {"_ClearLogicalFreeList", f_clear_free_list, METH_NOARGS,
+     "_ClearLogicalFreeList() -> int: frees the dead records kept for reuse, returns their number."},
     {"_SplitLogicals", f_split, METH_O,
      "_SplitLogicals(text) -> list of CLogicalLine, parents linked."},
     {nullptr, nullptr, 0, nullptr}};

@@ -34,6 +34,9 @@ private:
   Py_ssize_t Count;
 };
 
+/// Frees the records kept for reuse; returns how many there were.
+TL_HIDDEN int clearLogicalFreeList();
+
 /// New reference: an exact CLogicalLine taking A's tokens; steals LineText.
 TL_HIDDEN LogicalLineObject *newLogical(TokenArrays &A, int Kind, long FirstLine, long Indent,
                                         tl::Ref LineText);

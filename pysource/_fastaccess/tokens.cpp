@@ -41,6 +41,9 @@ size_t slotOf(uint64_t Key, size_t Len) {
   return static_cast<size_t>(((Key ^ Len) * 0x9E3779B97F4A7C15ull) >> 55) & (kCacheSlots - 1);
 }
 
+/// The one-byte texts, shared by every split. Filled at import.
+PyObject *CharTexts[256];
+
 const char *const kSharedTexts[] = {
     // Keywords of Python 2 and 3, and names nearly every file uses.
     "and", "as", "assert", "async", "await", "break", "class", "continue", "def", "del", "elif",
@@ -56,6 +59,10 @@ const char *const kSharedTexts[] = {
 
 int initTokenTextCache() {
   return guard(-1, [] {
+    for (int C = 0; C < 256; ++C) {
+      char Byte = static_cast<char>(C);
+      CharTexts[C] = require(PyString_FromStringAndSize(&Byte, 1)).release();
+    }
     for (const char *T : kSharedTexts) {
       size_t Len = std::strlen(T);
       if (Len > 8)
@@ -128,7 +135,9 @@ public:
 
   /// New reference: the shared text for Text[0..Len).
   Ref get(const char *Text, size_t Len, TokenKind Kind) {
-    if (Len < 2 || Len > kMaxLen)
+    if (Len == 1)
+      return Ref::borrow(CharTexts[static_cast<unsigned char>(Text[0])]);
+    if (Len > kMaxLen || Kind == TokenKind::COMMENT)
       return tokenText(Text, Len, Kind);
     if (Used * 2 >= Slots.size())
       grow();
@@ -166,9 +175,18 @@ private:
   };
 
   static uint64_t hash(const char *Text, size_t Len) {
-    uint64_t H = 1469598103934665603ull;
-    for (size_t I = 0; I < Len; ++I)
-      H = (H ^ static_cast<unsigned char>(Text[I])) * 1099511628211ull;
+    uint64_t H = Len * 0x9E3779B97F4A7C15ull;
+    for (; Len >= 8; Text += 8, Len -= 8) {
+      uint64_t W;
+      std::memcpy(&W, Text, 8);
+      H = (H ^ W) * 0xff51afd7ed558ccdull;
+      H ^= H >> 32;
+    }
+    if (Len) {
+      uint64_t W = 0;
+      std::memcpy(&W, Text, Len);
+      H = (H ^ W) * 0xff51afd7ed558ccdull;
+    }
     return H ^ (H >> 29);
   }
 

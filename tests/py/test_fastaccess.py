@@ -195,6 +195,27 @@ class RecordTest(unittest.TestCase):
             last = L
         del L, last  # must not overflow the C stack
 
+    def testRecycledRecordsStartClean(self):
+        text = b'class A:\n    def f(self): pass\n'
+        for L in GetLogicalsFromText(text):
+            L.fInspected = True
+            L.fLocalScopeDefined = b'x'
+            L.AppendNameDefined(b'n')
+            L.AppendArgTypeEquiv(b'a', b'i')
+            L.fTokens
+        self.assertGreater(fa._ClearLogicalFreeList() + 1, 0)
+        first = GetLogicalsFromText(text)
+        del first
+        again = GetLogicalsFromText(text)
+        for L in again:
+            self.assertEqual((L.fInspected, L.fLocalScopeDefined, L.fNamesDefined,
+                              L.fArgTypeEquivs, L.fTokenCount > 0), (False, None, [], [], True))
+        self.assertIs(again[1].fParentScope, again[0])
+        self.assertIsNone(again[0].fParentScope)
+        del again
+        self.assertEqual(fa._ClearLogicalFreeList(), 2)
+        self.assertEqual(fa._ClearLogicalFreeList(), 0)
+
     def testRepr(self):
         L = fa.CLogicalLine([(b'x', (0, 0))], 2, 5)
         self.assertEqual(repr(L), '<pysource._fastaccess.CLogicalLine kind=2 line=5 tokens=1>')
