@@ -256,6 +256,10 @@ PyObject *TestListStarExprOps::getSubExpr(NodeObject *N, Py_ssize_t I) const {
     if (J >= nodeGetChildCount(N))
       tl::raise(PyExc_ValueError, "Not enough expressions in list");
     NodeObject *Item = childAt(N, J);
+    // The 3.x Ellipsis token is a plain leaf, not an expression node: an
+    // element with no expression to give.
+    if (leafIs(Item, "..."))
+      return Py_None;
     if (!isNodeOf(obj(Item), C::CExpression)) {
       Ref NodeRepr = tl::require(PyObject_Repr(obj(N)));
       Ref ChildrenRepr = tl::require(PyObject_Repr(N->Children));
