@@ -226,7 +226,8 @@ Ref ownTextForNode(ConverterObject *Cv, NodeObject *N, TextOptions O) {
 }
 
 /// The text a "(" or "[" trailer adds: the brackets around the nested node's
-/// text, spaced by JoinTokens as inside those brackets.
+/// text. The text of a composite node is spaced by JoinTokens as inside those
+/// brackets, where ":" and "=" are written without blanks (a[1:2], f(a=1)).
 void appendBracketTrailer(ConverterObject *Cv, NodeObject *Trailer, const char *Open, const char *Close,
                           bool WithContents, bool DottedNameOnly, std::string &Out) {
   if (WithContents) {
@@ -234,7 +235,14 @@ void appendBracketTrailer(ConverterObject *Cv, NodeObject *Trailer, const char *
     if (Inner.get() != Py_None) {
       TextOptions InnerOptions;
       InnerOptions.DottedNameOnly = DottedNameOnly;
+      bool Leaf = isNode(Inner.get()) && node(Inner.get())->Text;
       Ref Text = textForNode(convObj(Cv), Inner.get(), InnerOptions);
+      if (Text.get() != Py_None && Leaf) {
+        Out += Open;
+        Out.append(PyString_AS_STRING(Text.get()), PyString_GET_SIZE(Text.get()));
+        Out += Close;
+        return;
+      }
       if (Text.get() != Py_None) {
         Ref OpenText = tl::require(PyString_FromString(Open));
         Ref CloseText = tl::require(PyString_FromString(Close));
