@@ -5,6 +5,8 @@
 #include "pysource/treelens/nodes/expr.h"
 #include "pysource/treelens/nodes/nodehelp.h"
 
+#include <string>
+
 namespace treelens {
 
 using tl::Ref;
@@ -228,6 +230,38 @@ PyObject *util_StripPyQuotes(PyObject *, PyObject *Txt) {
   return tl::guard<PyObject *>(nullptr, [&] { return stripPyQuotes(Txt).release(); });
 }
 
+// _NativeOnly(name, *args): calls one of the operations native code reaches
+// but Python does not, so that tests can check them.
+PyObject *util_NativeOnly(PyObject *, PyObject *Args) {
+  return tl::guard<PyObject *>(nullptr, [&]() -> PyObject * {
+    const char *Name;
+    PyObject *A = nullptr, *B = nullptr, *D = nullptr;
+    if (!PyArg_ParseTuple(Args, "sO|OO:_NativeOnly", &Name, &A, &B, &D))
+      throw tl::PyErrSet();
+    auto Index = [&](PyObject *O) {
+      if (!O)
+        tl::raise(PyExc_TypeError, "an index is required");
+      return indexArg(O);
+    };
+    std::string Op = Name;
+    if (Op == "ExpandSeqLiteral")
+      return expandSeqLiteral(A, B && tl::requireStatus(PyObject_IsTrue(B)),
+                              !D || tl::requireStatus(PyObject_IsTrue(D)))
+          .release();
+    if (Op == "NextNonRemovedTokenInLogical")
+      return tl::Ref::borrow(nextNonRemovedTokenInLogical(A, Index(B))).release();
+    if (Op == "NextNonRemovedTokenInList")
+      return tl::Ref::borrow(nextNonRemovedTokenInList(A, Index(B))).release();
+    if (!isNode(A))
+      raiseCannotConvert(A, cnodeType());
+    if (Op == "CLambdaExpr.GetArgumentsNode")
+      return lambdaGetArgumentsNode(node(A)).release();
+    if (Op == "CLambdaExpr.GetBodyExpr")
+      return lambdaGetBodyExpr(node(A)).release();
+    tl::raiseFormat(PyExc_ValueError, "no native-only operation %.100s", Name);
+  });
+}
+
 } // namespace
 
 PyMethodDef NodeUtilFunctions[] = {
@@ -244,6 +278,10 @@ PyMethodDef NodeUtilFunctions[] = {
     {"StripPyQuotes", util_StripPyQuotes, METH_O,
      "StripPyQuotes(txt) -> (stripped, prefix, suffix): prefix + stripped + suffix == txt; prefix and "
      "suffix are empty unless txt is a complete string literal"},
+    {"_NativeOnly", util_NativeOnly, METH_VARARGS,
+     "_NativeOnly(name, *args): calls the native-only operation name (ExpandSeqLiteral, "
+     "NextNonRemovedTokenInLogical, NextNonRemovedTokenInList, CLambdaExpr.GetArgumentsNode, "
+     "CLambdaExpr.GetBodyExpr); for tests"},
     {nullptr, nullptr, 0, nullptr}};
 
 } // namespace treelens
