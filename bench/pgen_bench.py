@@ -10,6 +10,7 @@ pgen_bench), it also times the engine alone on the same tokens.
 """
 
 import argparse
+import gc
 import os
 import subprocess
 import sys
@@ -105,6 +106,8 @@ def main():
     ap = argparse.ArgumentParser(description=__doc__.splitlines()[0])
     ap.add_argument('--files', type=int, default=None,
                     help='sample this many stdlib files (default: all)')
+    ap.add_argument('--gc', action='store_true',
+                    help='leave the cyclic garbage collector on while timing')
     args = ap.parse_args()
 
     grammar = GrammarFor('2.7')
@@ -134,11 +137,14 @@ def main():
         all_streams.extend(streams)
         lines += len(streams)
         tokens += sum(len(s) for s in streams)
+        if not args.gc:
+            gc.disable()
         for i, (name, timer, parser) in enumerate(runs):
             totals[i] += timer(parser, streams)
+        gc.enable()
 
-    print('2.7 stdlib: %d files, %d logical lines, %d tokens'
-          % (len(files), lines, tokens))
+    print('2.7 stdlib: %d files, %d logical lines, %d tokens (collector %s)'
+          % (len(files), lines, tokens, 'on' if args.gc else 'off'))
     base = totals[kBase]
     print('%-50s %9s %12s %9s %9s' % ('parser', 'seconds', 'tokens/s',
                                       'ns/token', 'vs lib2to3'))

@@ -9,6 +9,8 @@
 #include "tables.h"
 
 #include <memory>
+#include <new>
+#include <vector>
 
 namespace optpgen {
 
@@ -21,13 +23,12 @@ using tl::guard;
 using tl::Ref;
 using tl::require;
 
-/// A nonterminal being built. Owns Context and its children: none (First and
-/// Children null), exactly one (First) or two and more (Children, a list).
+/// A nonterminal being built: owns Context; its children are the nodes of
+/// the child stack from FirstChild on.
 struct NodeFrame {
   int Type;
   PyObject *Context;
-  PyObject *First;
-  PyObject *Children;
+  size_t FirstChild;
 };
 
 /// The nonterminals being built, parallel to the engine's stack (which
@@ -57,6 +58,7 @@ public:
     Py_INCREF(Grammar);
     Py_XINCREF(Converter);
     Native = Raw ? nullptr : nativeConvertOf(Converter);
+    Children.reserve(64);
   }
   ~ParserImpl() { clear(); }
 
@@ -72,11 +74,14 @@ public:
   /// so callers hold the busy mark.
   void clearTree() {
     while (!Frames.empty()) {
-      NodeFrame F = Frames.back();
+      PyObject *Ctx = Frames.back().Context;
       Frames.pop_back();
-      Py_XDECREF(F.Context);
-      Py_XDECREF(F.First);
-      Py_XDECREF(F.Children);
+      Py_DECREF(Ctx);
+    }
+    while (!Children.empty()) {
+      PyObject *Node = Children.back();
+      Children.pop_back();
+      Py_DECREF(Node);
     }
     Py_CLEAR(Root);
   }
@@ -85,11 +90,10 @@ public:
     Py_VISIT(Grammar);
     Py_VISIT(Converter);
     Py_VISIT(Root);
-    for (const NodeFrame &F : Frames) {
+    for (const NodeFrame &F : Frames)
       Py_VISIT(F.Context);
-      Py_VISIT(F.First);
-      Py_VISIT(F.Children);
-    }
+    for (PyObject *Node : Children)
+      Py_VISIT(Node);
     return 0;
   }
 
@@ -97,7 +101,7 @@ public:
 
   bool push(int Symbol) {
     Py_INCREF(Context);
-    Frames.push_back(NodeFrame{Symbol, Context, nullptr, nullptr});
+    Frames.push_back(NodeFrame{Symbol, Context, Children.size()});
     return true;
   }
 
@@ -109,17 +113,22 @@ public:
     NodeFrame F = Frames.back();
     Frames.pop_back();
     Ref Ctx = Ref::steal(F.Context);
-    Ref First = Ref::steal(F.First);
-    Ref Kids = Ref::steal(F.Children);
-    if (Promote && First)
-      return adopt(First.release());
-    if (!Kids) {
-      Kids = Ref::steal(PyList_New(First ? 1 : 0));
-      if (!Kids)
-        return false;
-      if (First)
-        PyList_SET_ITEM(Kids.get(), 0, First.release());
+    size_t N = Children.size() - F.FirstChild;
+    if (Promote && N == 1) {
+      // The only child stays where it is, now a child of the parent.
+      if (Frames.empty()) {
+        PyObject *Only = Children.back();
+        Children.pop_back();
+        return adopt(Only);
+      }
+      return true;
     }
+    Ref Kids = Ref::steal(PyList_New(static_cast<Py_ssize_t>(N)));
+    if (!Kids)
+      return false;
+    for (size_t I = 0; I < N; ++I)
+      PyList_SET_ITEM(Kids.get(), I, Children[F.FirstChild + I]);
+    Children.resize(F.FirstChild);
     Ref SymbolObj;
     if (!Native) {
       SymbolObj = Ref::steal(PyInt_FromLong(Symbol));
@@ -139,6 +148,7 @@ public:
   bool Busy = false;              ///< inside addtoken, setup or a release
   ConvertFunc Native = nullptr;   ///< set when the converter's slot is used
   FrameStack Frames;
+  std::vector<PyObject *> Children; ///< owned; see NodeFrame
   pgen::Parser<ParserImpl> Driver;
 
   // The token being added; borrowed for the duration of addtoken.
@@ -174,25 +184,13 @@ private:
       Py_XDECREF(Old);
       return true;
     }
-    NodeFrame &F = Frames.back();
-    if (F.Children) {
-      int R = PyList_Append(F.Children, Node);
+    try {
+      Children.push_back(Node);
+    } catch (const std::bad_alloc &) {
       Py_DECREF(Node);
-      return R == 0;
-    }
-    if (!F.First) {
-      F.First = Node;
-      return true;
-    }
-    PyObject *List = PyList_New(2);
-    if (!List) {
-      Py_DECREF(Node);
+      PyErr_NoMemory();
       return false;
     }
-    PyList_SET_ITEM(List, 0, F.First);
-    PyList_SET_ITEM(List, 1, Node);
-    F.First = nullptr;
-    F.Children = List;
     return true;
   }
 };
@@ -344,8 +342,7 @@ void setupParser(PyObject *Self, PyObject *Start) {
       !P.Driver.setup(static_cast<int>(Symbol)))
     tl::raiseFormat(PyExc_ValueError, msg::UnknownStart, Symbol);
   Py_INCREF(Py_None);
-  P.Frames.push_back(
-      NodeFrame{static_cast<int>(Symbol), Py_None, nullptr, nullptr});
+  P.Frames.push_back(NodeFrame{static_cast<int>(Symbol), Py_None, 0});
 }
 
 PyObject *parser_setup(PyObject *Self, PyObject *Args, PyObject *Kw) {
