@@ -69,7 +69,14 @@ extern "C" __attribute__((visibility("default"))) void initoptpgen() {
   PyObject *M = Py_InitModule3(
       "pysource.optpgen", ModuleMethods,
       "Native pgen parser engine: ParserGenerator, CreateParser, Parser, "
-      "NodeConverter, ParseError.");
+      "NodeConverter, ParseError.\n\n"
+      "Parsers follow lib2to3.pgen2.parse.Parser token for token. Beyond it: "
+      "at most kMaxDepth nonterminals may be open at once (ParseError 'too "
+      "much nesting'); a token after the input is complete is a ParseError "
+      "'too much input'; after any error, and before the first setup(), "
+      "addtoken() raises RuntimeError until setup() is called; convert() may "
+      "not call back into its parser (RuntimeError). A grammar object's "
+      "tables are compiled once and shared while the object lives.");
   if (!M)
     return;
   guard(0, [&] {

@@ -429,6 +429,22 @@ class GrammarTablesTest(OptpgenTestBase):
         gc.collect()
         self.assertIsNone(ref())
 
+    def testGeneratorTokenTables(self):
+        names, ops = corpus.TokenTables()
+        grammar = corpus.GrammarFor('3.6')
+        self.assertEqual('pysource._pgengen', optpgen.ParserGenerator.__module__)
+        # '->' and '...' take the numbers the tables give; ASYNC and AWAIT are
+        # token names of the 3.6 grammar.
+        for number in (51, 52, 53, 54):
+            self.assertIn(number, grammar.tokens, number)
+        self.assertNotIn(55, grammar.tokens)
+        with self.assertRaises(ValueError):
+            optpgen.ParserGenerator('<x>', names, {}, StringIO.StringIO(
+                "start: '+' NAME ENDMARKER\n")).make_grammar()
+        with self.assertRaises(ValueError):
+            optpgen.ParserGenerator('<x>', {1: 'NAME'}, ops, StringIO.StringIO(
+                "start: NAME ENDMARKER\n")).make_grammar()
+
     def testMalformedGrammars(self):
         def Broken(change):
             g = TinyGrammar()
