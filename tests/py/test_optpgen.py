@@ -100,16 +100,6 @@ class TreeTest(OptpgenTestBase):
             self.assertEqual(corpus.ReferenceParse(ref, toks),
                              corpus.NativeParse(raw, toks), name)
 
-    def testRootShape(self):
-        p = optpgen.CreateParser(self.grammar, None)
-        self.assertTrue(Feed(p, kAssign))
-        root = p.getrootnode()
-        self.assertEqual((self.sym['start'], None, None), root[:3])
-        stmt = root[3][0]
-        self.assertEqual((self.sym['stmt'], None, 0), stmt[:3])
-        self.assertEqual((EQUAL, '=', 1, None), stmt[3][1])
-        self.assertIs(root, p.rootnode)
-
     def testPromoteSingleChild(self):
         raw = optpgen.CreateParser(self.grammar, None)
         promoted = optpgen.CreateParser(self.grammar, None,
