@@ -40,7 +40,7 @@ TL_HIDDEN int initTokenTextCache();
 
 /// Throws unless Obj is a logical-line record (subclasses included).
 TL_HIDDEN LogicalLineObject *asLogical(PyObject *Obj);
-/// Throws unless Obj is bytes; What names the argument in the message.
+/// Throws TypeError "Expected bytes, got <type>" unless Obj is bytes.
 TL_HIDDEN void expectBytes(PyObject *Obj);
 
 // Record operations shared by the Python functions and the capsule table.
