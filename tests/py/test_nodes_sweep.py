@@ -157,6 +157,16 @@ class Sweep(object):
             nested = node.GetNestedNode()
             if nested is not None:
                 self.Call(where, node, tl.GetUsedArgInfoList, nested)
+        elif isinstance(node, (tl.CClassdefStmt, tl.CSingleDecorator)):
+            texts = [c.fText for c in node.fChildren]
+            if b'(' in texts and texts[texts.index(b'(') + 1] != b')':
+                self.Call(where, node, tl.GetUsedArgInfoList, node.fChildren[texts.index(b'(') + 1])
+        if isinstance(node, tl.CLambdaExpr):
+            for op in ('GetArgumentsNode', 'GetBodyExpr'):
+                self.Call(where, node, lambda n: tl._CallNativeNodeOp(n, op), node)
+        elif isinstance(node, tl.CAtom):
+            self.Call(where, node, lambda n: tl._NativeOnly('ExpandSeqLiteral', n, 1), node)
+            self.Call(where, node, lambda n: tl._NativeOnly('ExpandSeqLiteral', n, 0, False), node)
 
     def Call(self, where, node, func, arg):
         self.counts['calls'] += 1
@@ -180,6 +190,8 @@ class Sweep(object):
                 if tree is None:
                     continue
                 self.counts['trees'] += 1
+                for i in range(-1, logical.fTokenCount):
+                    tl._NativeOnly('NextNonRemovedTokenInLogical', logical, i)
                 self.token_count = logical.fTokenCount
                 where = '%s:%d' % (path, logical.fFirstLine + 1)
                 for node in Nodes(tree):

@@ -199,10 +199,9 @@ class LambdaTest(unittest.TestCase):
         for source, args, body in [(b'lambda: x', None, b'x'), (b'lambda a, b=1: a + b', b'a , b = 1', b'a + b'),
                                    (b'lambda *a: a', b'* a', b'a')]:
             lam = Find(Parse('3.6', b'z = ' + source), tl.CLambdaExpr)
-            self.assertEqual(Text(tl._NativeOnly('CLambdaExpr.GetArgumentsNode', lam)), args, source)
-            self.assertEqual(Text(tl._NativeOnly('CLambdaExpr.GetBodyExpr', lam)), body, source)
-        with self.assertRaises(TypeError):
-            tl._NativeOnly('CLambdaExpr.GetBodyExpr', tl.CAtom(None))
+            self.assertEqual(Text(tl._CallNativeNodeOp(lam, 'GetArgumentsNode')), args, source)
+            self.assertEqual(Text(tl._CallNativeNodeOp(lam, 'GetBodyExpr')), body, source)
+        self.assertRaises(AttributeError, tl._CallNativeNodeOp, tl.CAtom(None), 'GetBodyExpr')
 
 
 if __name__ == '__main__':

@@ -230,8 +230,9 @@ PyObject *util_StripPyQuotes(PyObject *, PyObject *Txt) {
   return tl::guard<PyObject *>(nullptr, [&] { return stripPyQuotes(Txt).release(); });
 }
 
-// _NativeOnly(name, *args): calls one of the operations native code reaches
-// but Python does not, so that tests can check them.
+// _NativeOnly(name, *args): calls one of the module-level operations native
+// code reaches but Python does not, so that tests can check them (the node
+// classes' native-only operations: _CallNativeNodeOp).
 PyObject *util_NativeOnly(PyObject *, PyObject *Args) {
   return tl::guard<PyObject *>(nullptr, [&]() -> PyObject * {
     const char *Name;
@@ -252,12 +253,6 @@ PyObject *util_NativeOnly(PyObject *, PyObject *Args) {
       return tl::Ref::borrow(nextNonRemovedTokenInLogical(A, Index(B))).release();
     if (Op == "NextNonRemovedTokenInList")
       return tl::Ref::borrow(nextNonRemovedTokenInList(A, Index(B))).release();
-    if (!isNode(A))
-      raiseCannotConvert(A, cnodeType());
-    if (Op == "CLambdaExpr.GetArgumentsNode")
-      return lambdaGetArgumentsNode(node(A)).release();
-    if (Op == "CLambdaExpr.GetBodyExpr")
-      return lambdaGetBodyExpr(node(A)).release();
     tl::raiseFormat(PyExc_ValueError, "no native-only operation %.100s", Name);
   });
 }
@@ -280,8 +275,7 @@ PyMethodDef NodeUtilFunctions[] = {
      "suffix are empty unless txt is a complete string literal"},
     {"_NativeOnly", util_NativeOnly, METH_VARARGS,
      "_NativeOnly(name, *args): calls the native-only operation name (ExpandSeqLiteral, "
-     "NextNonRemovedTokenInLogical, NextNonRemovedTokenInList, CLambdaExpr.GetArgumentsNode, "
-     "CLambdaExpr.GetBodyExpr); for tests"},
+     "NextNonRemovedTokenInLogical, NextNonRemovedTokenInList); for tests"},
     {nullptr, nullptr, 0, nullptr}};
 
 } // namespace treelens
