@@ -113,7 +113,10 @@ class DefiningTest(unittest.TestCase):
         with self.assertRaises(AssertionError) as ctx:
             tl.GetDefiningArgInfoList(Find(Parse('3.6', b'z = (a)'), tl.CAtom))
         self.assertIsInstance(ctx.exception.args[0], tl.CAtom)
-        self.assertRaises(AssertionError, tl.GetDefiningArgInfoList, None)
+        for value in (None, (1, 2)):
+            with self.assertRaises(AssertionError) as ctx:
+                tl.GetDefiningArgInfoList(value)
+            self.assertEqual(ctx.exception.args, (value,))
 
     def testParenAssertion(self):
 

@@ -232,9 +232,11 @@ class AtomExprPowerTest(unittest.TestCase):
 class LiteralTest(unittest.TestCase):
 
     def testNumbers(self):
-        for text, is_float in [(b'0x1e', True), (b'10', False), (b'1.5', True), (b'1j', False),
-                               (b'1e5', True), (b'1E5', True), (b'.5', True), (b'0777L', False)]:
+        for text, is_float in [(b'0x1e', False), (b'0XE', False), (b'0x1EL', False), (b'10', False),
+                               (b'1.5', True), (b'1j', False), (b'1e5', True), (b'1E5', True), (b'.5', True),
+                               (b'0777L', False), (b'0e0', True), (b'1_0.5', True)]:
             number = Find(Parse('2.7' if text.endswith(b'L') else '3.6', b'z = ' + text), tl.CNumberLiteral)
+            self.assertEqual(number.fText, text)
             self.assertIs(number.IsFloat(), is_float, text)
 
     def testStrings(self):

@@ -259,7 +259,8 @@ Ref getDefiningArgInfoList(PyObject *Node) {
     return oneItemList(Arg.get());
   }
   if (!isNodeOf(Current.get(), C::CNameLiteral) && assertionsEnabled()) {
-    PyErr_SetObject(PyExc_AssertionError, Current.get());
+    Ref Exc = tl::require(PyObject_CallFunctionObjArgs(PyExc_AssertionError, Current.get(), nullptr));
+    PyErr_SetObject(PyExc_AssertionError, Exc.get());
     throw tl::PyErrSet();
   }
   Ref Arg = newArgInfo();

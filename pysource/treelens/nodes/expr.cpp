@@ -323,12 +323,16 @@ Ref PowerOps::getExponentNode(NodeObject *N) const {
 
 // ---- Literals and unary factors ----
 
+// A float has a '.' or an exponent; the digits e and E of a hexadecimal
+// literal (0x1e) are no exponent.
 bool NumberLiteralOps::isFloat(NodeObject *N) const {
   return neverRaises("pysource.treelens.CNumberLiteral.IsFloat", false, [&] {
     if (!N->Text)
       tl::raise(PyExc_TypeError, "argument of type 'NoneType' is not iterable");
     PyObject *T = leafText(N, "IsFloat");
     const char *S = PyString_AS_STRING(T);
+    if (PyString_GET_SIZE(T) >= 2 && S[0] == '0' && (S[1] == 'x' || S[1] == 'X'))
+      return false;
     for (Py_ssize_t K = 0; K < PyString_GET_SIZE(T); ++K)
       if (S[K] == '.' || S[K] == 'e' || S[K] == 'E')
         return true;
