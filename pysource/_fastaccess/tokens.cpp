@@ -50,7 +50,7 @@ const char *const kSharedTexts[] = {
     "else", "except", "exec", "finally", "for", "from", "global", "if", "import", "in", "is",
     "lambda", "nonlocal", "not", "or", "pass", "print", "raise", "return", "try", "while",
     "with", "yield", "True", "False", "None", "self", "cls", "len", "str", "int", "object",
-    "isinstance", "append", "name", "value", "args", "kwargs", "__init__", "__name__",
+    "append", "name", "value", "args", "kwargs", "__init__", "__name__",
     // Operators of two and three bytes.
     "==", "!=", "<>", "<=", ">=", "<<", ">>", "**", "+=", "-=", "*=", "/=", "%=", "&=", "|=",
     "^=", "<<=", ">>=", "**=", "//", "//=", "@=", "->", "..."};
@@ -65,7 +65,7 @@ int initTokenTextCache() {
     }
     for (const char *T : kSharedTexts) {
       size_t Len = std::strlen(T);
-      if (Len > 8)
+      if (Len > 8) // the key holds 8 bytes
         continue;
       uint64_t Key = packKey(T, Len);
       size_t S = slotOf(Key, Len);
@@ -82,6 +82,8 @@ int initTokenTextCache() {
 }
 
 Ref tokenText(const char *Text, size_t Len, TokenKind Kind) {
+  if (Len == 1)
+    return Ref::borrow(CharTexts[static_cast<unsigned char>(Text[0])]);
   if (Len >= 2 && Len <= 8 && Kind != TokenKind::STRING && Kind != TokenKind::NUMBER &&
       Kind != TokenKind::COMMENT) {
     uint64_t Key = packKey(Text, Len);
@@ -135,9 +137,7 @@ public:
 
   /// New reference: the shared text for Text[0..Len).
   Ref get(const char *Text, size_t Len, TokenKind Kind) {
-    if (Len == 1)
-      return Ref::borrow(CharTexts[static_cast<unsigned char>(Text[0])]);
-    if (Len > kMaxLen || Kind == TokenKind::COMMENT)
+    if (Len < 2 || Len > kMaxLen || Kind == TokenKind::COMMENT)
       return tokenText(Text, Len, Kind);
     if (Used * 2 >= Slots.size())
       grow();
