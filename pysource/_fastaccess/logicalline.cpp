@@ -4,9 +4,8 @@
 
 #include "typedesc.h"
 
-#include <stddef.h>
 #include <cstring>
-#include <structmember.h>
+#include <stddef.h>
 
 namespace fastaccess {
 
@@ -22,16 +21,19 @@ namespace {
 
 LogicalLineObject *self(PyObject *O) { return reinterpret_cast<LogicalLineObject *>(O); }
 
-/// Drops the token arrays (the texts are owned).
+/// Drops the token arrays (the texts are owned). The record is emptied
+/// first: a text of a str subclass may run Python code as it dies.
 void freeTokens(LogicalLineObject *L) {
-  for (Py_ssize_t I = 0; I < L->TokenCount; ++I)
-    Py_XDECREF(L->Texts[I]);
-  PyMem_Free(L->Texts);
+  PyObject **Texts = L->Texts;
+  Py_ssize_t N = L->TokenCount;
   L->Texts = nullptr;
   L->Positions = nullptr;
   L->Types = nullptr;
   L->TokenCount = 0;
   Py_CLEAR(L->TokensView);
+  for (Py_ssize_t I = 0; I < N; ++I)
+    Py_XDECREF(Texts[I]);
+  PyMem_Free(Texts);
 }
 
 /// The list in *Slot, created empty on first use (borrowed).
