@@ -7,8 +7,6 @@
 #include "pysource/treelens/host/host.h"
 #include "pysource/treelens/walker/walker.h"
 
-#include <frameobject.h>
-
 #include <string>
 
 namespace treelens {

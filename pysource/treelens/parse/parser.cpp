@@ -286,11 +286,9 @@ Ref buildClsForStateList(ParserObject *P) {
   Ref ClsForState = tl::require(PyObject_GetAttrString(reinterpret_cast<PyObject *>(&ParserType),
                                                         "kClsForState"));
   tl::expectType(PyDict_Check(ClsForState.get()), "dict", ClsForState.get());
-  PyObject *Key, *Value;
-  Py_ssize_t Pos = 0;
   Ref Items = tl::require(PyDict_Values(Host.ModuleDict));
   for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Items.get()); ++I) {
-    Value = PyList_GET_ITEM(Items.get(), I);
+    PyObject *Value = PyList_GET_ITEM(Items.get(), I);
     if (Py_TYPE(Value) != &PyType_Type ||
         !PyType_IsSubtype(reinterpret_cast<PyTypeObject *>(Value), &cnodeType()))
       continue;
@@ -303,12 +301,11 @@ Ref buildClsForStateList(ParserObject *P) {
     if (PyErr_Occurred())
       throw tl::PyErrSet();
   }
-  (void)Key;
-  (void)Pos;
   Ref Number2Symbol = tl::require(PyObject_GetAttrString(P->Grammar, "number2symbol"));
   tl::expectType(PyDict_Check(Number2Symbol.get()), "dict", Number2Symbol.get());
   long Max = -1;
-  Pos = 0;
+  PyObject *Key, *Value;
+  Py_ssize_t Pos = 0;
   while (PyDict_Next(Number2Symbol.get(), &Pos, &Key, &Value)) {
     long K = PyInt_AsLong(Key);
     if (K == -1 && PyErr_Occurred())
