@@ -22,7 +22,7 @@ from pysource.utils import GetLogicalsFromText  # noqa: E402
 
 
 def StdlibLogicals(text):
-    """Logical lines of text as lists of token strings, through the stdlib tokenizer."""
+    """Logical lines of text as lists of (type, text) pairs, through the stdlib tokenizer."""
     logicals, current = [], []
     try:
         for typ, s, _, _, _ in tokenize.generate_tokens(StringIO.StringIO(text).readline):
