@@ -38,18 +38,11 @@ def CheckInvariants(test, text, logicals, label):
 class GetTokenTypeTest(unittest.TestCase):
 
     def testTable(self):
+        # The engine's own tests cover the forms; these check the binding end to end.
         cases = [
-            (b'', 0), (b'\n', 4), (b'x', 1), (b'print', 1), (b'async', 1), (b'await', 1),
-            (b'\xc3\xa9', 1), (b'0777L', 2), (b'0b1', 2), (b'0o7', 2), (b'0x1F', 2),
-            (b'1_000', 2), (b'1e-5', 2), (b'1j', 2), (b'.5', 2), (b'1.', 2),
-            (b"'x'", 3), (b'"""x"""', 3), (b"'unterminated", 3),
-            (b"b''", 3), (b"R''", 3), (b"u''", 3), (b"F''", 3), (b"bR''", 3), (b"Rb''", 3),
-            (b"fr''", 3), (b"rF''", 3), (b"Ur''", 3),
-            (b'<>', 29), (b'!=', 29), (b'@', 50), (b'@=', 51), (b'->', 51), (b'...', 52),
-            (b'`', 25), (b'//=', 49), (b'**=', 47), (b'>>=', 46),
-            (b'$', 201), (b'?', 201), (b'!', 201), (b'# c', 202), (b'\\', 203),
-            # Near misses.
-            (b'..', 23), (b'ub', 1), (b"bu''", 1), (b'br', 1),
+            (b'', 0), (b'\n', 4), (b'print', 1), (b'\xc3\xa9', 1), (b'0777L', 2), (b'.5', 2),
+            (b"fR''", 3), (b"'unterminated", 3), (b'...', 52), (b'$', 201), (b'!', 201),
+            (b'# c', 202), (b'\\', 203), (b'..', 23), (b"bu''", 1),
         ]
         for text, want in cases:
             self.assertEqual(fa.GetTokenType(text), want, 'GetTokenType(%r)' % text)
