@@ -345,6 +345,36 @@ class TrailerTest(unittest.TestCase):
         self.assertFalse(hasattr(tl.CLambdaExpr, 'GetArgumentsNode'))
 
 
+class RefcountTest(unittest.TestCase):
+
+    def testAccessorsKeepRefcounts(self):
+        sources = [('3.6', b'z = [(a, b), [c], -d ** e.f(g)[h], (yield from i), *j, 1.5, u"k", '
+                           b'(x async for x in y)]'),
+                   ('2.7', b'z = [a for b in c], [d, e], `f`, a.b(c) ** 2')]
+        for version, source in sources:
+            tree = Parse(version, source, in_async_def=True)
+            nodes = Nodes(tree)
+            calls = []
+            for node in nodes:
+                for name in ('GetSubExpr', 'GetSubExprCount', 'GetInitialBracket', 'IsLiteral', 'IsComprehension',
+                             'IsTwoPlusStringLiterals', 'GetStarredExpression', 'GetValue', 'IsYieldFrom',
+                             'IsTuple', 'IsGenExpr', 'GetPrefix', 'GetAtom', 'GetTrailers', 'GetExponentNode',
+                             'IsFloat', 'IsUnicode', 'GetStringContents', 'GetUnaryOperator', 'IsAsync',
+                             'GetTargetNode', 'GetInNode', 'GetCompIterNode', 'GetDotName', 'GetNestedNode',
+                             'GetInitialToken'):
+                    method = getattr(node, name, None)
+                    if method is not None:
+                        calls.append((method, (0,) if name == 'GetSubExpr' else ()))
+            for method, args in calls:
+                method(*args)
+            before = [sys.getrefcount(n) for n in nodes] + [sys.getrefcount(n.fText) for n in nodes]
+            for _ in range(100):
+                for method, args in calls:
+                    method(*args)
+            after = [sys.getrefcount(n) for n in nodes] + [sys.getrefcount(n.fText) for n in nodes]
+            self.assertEqual(after, before, version)
+
+
 class OverrideTest(unittest.TestCase):
     """Python subclasses built by the parser: native callers honour their overrides."""
 
