@@ -283,8 +283,16 @@ Ref ownTextForAtomPlusTrailers(ConverterObject *Cv, PyObject *Atom, PyObject *Tr
       Ref Name = trailerGetDotName(T);
       if (Name.get() != Py_None) {
         tl::expectType(PyString_Check(Name.get()), "bytes", Name.get());
-        Out += '.';
-        Out.append(PyString_AS_STRING(Name.get()), PyString_GET_SIZE(Name.get()));
+        if (!Out.empty() && Out.back() >= '0' && Out.back() <= '9') {
+          // After a number the dot may need a blank: 3 .real is not 3. real.
+          Ref Head = tl::require(PyString_FromStringAndSize(Out.data(), static_cast<Py_ssize_t>(Out.size())));
+          Ref Dot = tl::require(PyString_FromString("."));
+          Ref Joined = joinTexts({Head.get(), Dot.get(), Name.get()});
+          Out.assign(PyString_AS_STRING(Joined.get()), PyString_GET_SIZE(Joined.get()));
+        } else {
+          Out += '.';
+          Out.append(PyString_AS_STRING(Name.get()), PyString_GET_SIZE(Name.get()));
+        }
       }
     } else if (textIs(Tok.get(), "(")) {
       appendBracketTrailer(Cv, T, "(", ")", Cv->IncludeArgText, O.LiteralOnly, Out);
