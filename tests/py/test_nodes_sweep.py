@@ -50,6 +50,28 @@ def AccessorTable():
         tl.CSingleUsedArgumentNode: _NoArgs('GetPrefix', 'GetName', 'GetValue', 'IsUnparenthesizedGenExpr'),
         tl.CParametersNode: [('GetArgName', (0,))],
         tl.CNode: _NoArgs('GetChildCount', 'GetStateName') + [('GetChild', (0,)), ('GetChildText', (0,))],
+        tl.CFuncdefStmt: _NoArgs('GetParameters', 'GetReturnType', 'GetSuite'),
+        tl.CClassdefStmt: _NoArgs('GetBaseClassList'),
+        tl.CGlobalStmt: _NoArgs('GetUtf8NameList'),
+        tl.CNonlocalStmt: _NoArgs('GetUtf8NameList'),
+        tl.CForStmt: _NoArgs('GetTarget', 'GetInExpression', 'GetBody', 'GetElseBody'),
+        tl.CExprStmt: _NoArgs('GetAnnotatedAssignNode', 'GetInitialTestExpr', 'GetAugAssignOp'),
+        tl.CAnnotatedAssignNode: _NoArgs('GetTypeHintNode', 'GetPostEqualsTestExpr'),
+        tl.CReturnStmt: _NoArgs('GetValue'),
+        tl.CImportNamesStmt: _NoArgs('GetAsNameList'),
+        tl.CFromImportStmt: _NoArgs('_GetImportIndex', 'GetFromString', 'GetImportStar', 'GetAsNameList'),
+    }
+
+
+def NativeOnlyTable():
+    """Class -> names of its native-only operations, called through _CallNativeNodeOp."""
+    return {
+        tl.CFuncdefStmt: ('GetName',),
+        tl.CWithStmt: ('GetWithItems',),
+        tl.CWithItem: ('GetExpression', 'GetTarget'),
+        tl.CExceptClause: ('GetExceptionType', 'GetTarget'),
+        tl.CExprStmt: ('GetEqualCount',),
+        tl.CSingleDecorator: ('GetDottedName', 'GetUsedArgList'),
     }
 
 
@@ -80,6 +102,7 @@ class Sweep(object):
     def __init__(self, version):
         self.version = version
         self.table = [(cls, calls) for cls, calls in AccessorTable().items()]
+        self.native_only = NativeOnlyTable()
         self.failures = []
         self.counts = {'logicals': 0, 'trees': 0, 'nodes': 0, 'calls': 0, 'unparsed': 0}
 
@@ -161,6 +184,11 @@ class Sweep(object):
             texts = [c.fText for c in node.fChildren]
             if b'(' in texts and texts[texts.index(b'(') + 1] != b')':
                 self.Call(where, node, tl.GetUsedArgInfoList, node.fChildren[texts.index(b'(') + 1])
+        for op in self.native_only.get(type(node), ()):
+            self.Call(where, node, lambda n: tl._CallNativeNodeOp(n, op), node)
+        if isinstance(node, tl.CExprStmt):
+            for i in range(tl._CallNativeNodeOp(node, 'GetEqualCount')):
+                self.Call(where, node, lambda n: n.GetPostEqualsTestExpr(i), node)
         if isinstance(node, tl.CLambdaExpr):
             for op in ('GetArgumentsNode', 'GetBodyExpr'):
                 self.Call(where, node, lambda n: tl._CallNativeNodeOp(n, op), node)
