@@ -8,7 +8,11 @@ lines, completed the way the analyzer completes them (a block header gets a
 "pass" body, a lone else/elif/except/finally its opening clause, a decorator
 its function). Prints microseconds per logical line for both and their ratio.
 
-Usage: TREELENS_BUILD_DIR=<build> python2.7 bench/treelens_bench.py [repeat] [file_limit]
+A second pass renders every expression node of the same lines to text with
+the walker's converter (all three options true) and prints nanoseconds per
+node, side by side with the host's JoinTokens over each node's own tokens.
+
+Usage: TREELENS_BUILD_DIR=<build> python2.7 bench/treelens_bench.py [repeat] [file_limit] [render_repeat]
 """
 
 import ast
@@ -21,6 +25,7 @@ sys.path.insert(0, os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
 
 from tests.py import support  # noqa: E402
 from pysource import treelens  # noqa: E402
+from pysource import symbolinfo  # noqa: E402
 from pysource.utils import GetLogicalsFromText  # noqa: E402
 
 kTryKind = 11
@@ -95,6 +100,68 @@ def TimeCPython(sources, repeat):
     return best
 
 
+def ExpressionNodes(tree):
+    """(node, its leaf texts) for every expression node of a tree."""
+    out = []
+
+    def Visit(node):
+        if node.fChildren is None:
+            tokens = [node.fText]
+        else:
+            tokens = []
+            for child in node.fChildren:
+                tokens.extend(Visit(child))
+        if isinstance(node, treelens.CExpression):
+            out.append((node, tokens))
+        return tokens
+    Visit(tree)
+    return out
+
+
+def WalkerConverter():
+    """The converter the symbol walker renders with: all three options true."""
+    conv = getattr(treelens.CNodeWalker(), '_fToText', None)
+    if conv is None:
+        conv = treelens.CNodeToTextConverter(include_string_contents=True, include_bracket_text=True,
+                                             include_arg_text=True)
+    return conv
+
+
+def TimeRendering(logicals, repeat):
+    """Best total seconds of TextForNode and of JoinTokens over every expression node, and the node count."""
+    parser = treelens.CPGenParserImpl((2, 7, 0), treelens.kPy2DefaultGrammar, None, False)
+    text_for_node = WalkerConverter().TextForNode
+    join = symbolinfo.JoinTokens
+    clock = time.time
+    best_ours = best_peer = None
+    count = 0
+    for _ in range(repeat):
+        ours = peer = 0.0
+        count = 0
+        for logical in logicals:
+            try:
+                tree = parser.ParseToNode(logical, False)
+            except Exception:
+                continue
+            if tree is None:
+                continue
+            pairs = ExpressionNodes(tree)
+            count += len(pairs)
+            start = clock()
+            for node, _ in pairs:
+                text_for_node(node)
+            middle = clock()
+            for _, tokens in pairs:
+                join(tokens)
+            ours += middle - start
+            peer += clock() - middle
+            del pairs
+            parser.DiscardNode(tree)
+        best_ours = ours if best_ours is None else min(best_ours, ours)
+        best_peer = peer if best_peer is None else min(best_peer, peer)
+    return best_ours, best_peer, count
+
+
 def main():
     repeat = int(sys.argv[1]) if len(sys.argv) > 1 else 3
     limit = int(sys.argv[2]) if len(sys.argv) > 2 else None
@@ -108,6 +175,12 @@ def main():
     print('treelens AnalyzeSingleLogical: %7.3f us/line' % (ours * 1e6 / n))
     print('CPython compile(PyCF_ONLY_AST): %7.3f us/line' % (peer * 1e6 / n))
     print('ratio treelens / CPython: %.3f' % (ours / peer))
+    render_repeat = int(sys.argv[3]) if len(sys.argv) > 3 else 1
+    ours, peer, nodes = TimeRendering(logicals, render_repeat)
+    print('expression nodes: %d (best of %d runs)' % (nodes, render_repeat))
+    print('treelens TextForNode, all options: %9.1f ns/node' % (ours * 1e9 / nodes))
+    print('symbolinfo.JoinTokens of the node tokens: %9.1f ns/node' % (peer * 1e9 / nodes))
+    print('ratio TextForNode / JoinTokens: %.3f' % (ours / peer))
 
 
 if __name__ == '__main__':
