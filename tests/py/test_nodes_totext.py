@@ -2,6 +2,7 @@
 TextForNode overrides seen from native code, and malformed trees."""
 
 import pickle
+import sys
 import unittest
 
 try:
@@ -102,6 +103,8 @@ class RenderTest(unittest.TestCase):
             (('3.6',), b'a[...]', b'a[...]'),
             (('3.6',), b'{**a, b: c}', b'{**a, b: c}'),
             (('3.6',), b'[*a, b]', b'[*a, b]'),
+            # Any node renders, a 2.7 print statement too.
+            (('2.7',), b'print >> f, a.b', si.JoinTokens([b'print', b'>>', b'f', b',', b'a.b'])),
         ]
         self.Check(AllTrue(), cases)
 
@@ -208,6 +211,22 @@ class RenderTest(unittest.TestCase):
         copy = pickle.loads(pickle.dumps(conv))
         self.assertEqual(copy.__reduce__()[2], (True, True, False))
         self.assertEqual(copy.TextForNode(Expr('2.7', b"f(x)['s']")), b"f(x)['']")
+
+
+class ReferenceTest(unittest.TestCase):
+
+    def testNoReferenceLeaks(self):
+        conv = AllTrue()
+        for source in (b'a.b(c, d=1)[e] ** 2', b"{'k': [x for x in y]}", b'f(x)', b"'s' 't'"):
+            tree = Expr('2.7', source)
+            watched = [conv, tree] + list(tree.fChildren)
+            conv.TextForNode(tree)
+            before = [sys.getrefcount(o) for o in watched]
+            for _ in range(100):
+                conv.TextForNode(tree)
+                conv.TextForNode(tree, dotted_name_only=True)
+                conv.TextForNode(tree, literal_only=True, discard_simple_parens=False)
+            self.assertEqual([sys.getrefcount(o) for o in watched], before, source)
 
 
 class OverrideTest(unittest.TestCase):

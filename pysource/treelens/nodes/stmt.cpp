@@ -239,9 +239,9 @@ Py_ssize_t getMatchingChildToken(NodeObject *N, PyObject *Text) {
 
 namespace {
 
-void appendImportText(PyObject *NodeList, std::string &Out);
+void appendImportText(PyObject *NodeList, Py_ssize_t Begin, Py_ssize_t End, std::string &Out);
 
-/// Appends the leaf texts under N; the recursion is guarded against cyclic trees.
+/// Appends the leaf texts under Item; the recursion is guarded against cyclic trees.
 void appendNodeImportText(PyObject *Item, std::string &Out) {
   if (!isNode(Item))
     raiseCannotConvert(Item, cnodeType());
@@ -253,9 +253,8 @@ void appendNodeImportText(PyObject *Item, std::string &Out) {
   }
   if (Py_EnterRecursiveCall(" in _TextForImportName"))
     throw tl::PyErrSet();
-  Ref Children = Ref::borrow(N->Children ? N->Children : Py_None);
   try {
-    appendImportText(Children.get(), Out);
+    appendImportText(N->Children ? N->Children : Py_None, 0, PY_SSIZE_T_MAX, Out);
   } catch (...) {
     Py_LeaveRecursiveCall();
     throw;
@@ -263,37 +262,45 @@ void appendNodeImportText(PyObject *Item, std::string &Out) {
   Py_LeaveRecursiveCall();
 }
 
-void appendImportText(PyObject *NodeList, std::string &Out) {
+/// Appends the leaf texts under the items [Begin, End) of NodeList.
+void appendImportText(PyObject *NodeList, Py_ssize_t Begin, Py_ssize_t End, std::string &Out) {
   if (!PyList_Check(NodeList))
     raiseArgType("node_list", "list", NodeList);
-  for (Py_ssize_t K = 0; K < PyList_GET_SIZE(NodeList); ++K)
+  for (Py_ssize_t K = Begin; K < End && K < PyList_GET_SIZE(NodeList); ++K)
     appendNodeImportText(PyList_GET_ITEM(NodeList, K), Out);
+}
+
+Ref bytesOf(const std::string &Text) {
+  return tl::require(PyString_FromStringAndSize(Text.data(), static_cast<Py_ssize_t>(Text.size())));
+}
+
+/// The import text of the items [Begin, End) of NodeList; a single leaf gives its own text object.
+Ref importTextOfRange(PyObject *NodeList, Py_ssize_t Begin, Py_ssize_t End) {
+  if (PyList_Check(NodeList) && End - Begin == 1 && Begin < PyList_GET_SIZE(NodeList)) {
+    PyObject *Only = PyList_GET_ITEM(NodeList, Begin);
+    if (isNode(Only) && node(Only)->Text && PyString_CheckExact(node(Only)->Text))
+      return Ref::borrow(node(Only)->Text);
+  }
+  std::string Out;
+  appendImportText(NodeList, Begin, End, Out);
+  return bytesOf(Out);
+}
+
+/// textForImportName([N]).
+Ref importTextOf(NodeObject *N) {
+  if (N->Text && PyString_CheckExact(N->Text))
+    return Ref::borrow(N->Text);
+  std::string Out;
+  appendNodeImportText(obj(N), Out);
+  return bytesOf(Out);
 }
 
 } // namespace
 
 Ref textForImportName(PyObject *NodeList) {
-  if (PyList_Check(NodeList) && PyList_GET_SIZE(NodeList) == 1) {
-    PyObject *Only = PyList_GET_ITEM(NodeList, 0);
-    if (isNode(Only) && node(Only)->Text && PyString_CheckExact(node(Only)->Text))
-      return Ref::borrow(node(Only)->Text);
-  }
-  std::string Out;
-  appendImportText(NodeList, Out);
-  return tl::require(PyString_FromStringAndSize(Out.data(), static_cast<Py_ssize_t>(Out.size())));
+  Py_ssize_t Size = PyList_Check(NodeList) ? PyList_GET_SIZE(NodeList) : 0;
+  return importTextOfRange(NodeList, 0, Size);
 }
-
-namespace {
-
-/// textForImportName([N]).
-Ref importTextOf(NodeObject *N) {
-  Ref List = tl::require(PyList_New(1));
-  Py_INCREF(obj(N));
-  PyList_SET_ITEM(List.get(), 0, obj(N));
-  return textForImportName(List.get());
-}
-
-} // namespace
 
 // dotted_as_name: dotted_name ['as' NAME]; import_as_name: NAME ['as' NAME]
 Ref processSingleModuleNameAs(NodeObject *N) {
@@ -433,10 +440,7 @@ Ref fromString(NodeObject *N) {
   Py_ssize_t I = fromImportGetImportIndex(N);
   if (I < 2)
     return none();
-  if (!N->Children)
-    raiseArgType("node_list", "list", Py_None);
-  Ref Slice = tl::require(PyList_GetSlice(N->Children, 1, I));
-  return textForImportName(Slice.get());
+  return importTextOfRange(N->Children ? N->Children : Py_None, 1, I);
 }
 
 bool importStar(NodeObject *N) { return leafIs(childAt(N, -1), "*"); }
