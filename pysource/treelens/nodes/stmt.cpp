@@ -64,6 +64,8 @@ Ref newList() { return tl::require(PyList_New(0)); }
 
 void append(PyObject *List, PyObject *Item) { tl::requireStatus(PyList_Append(List, Item)); }
 
+const char NotEnoughEquals[] = "Not enough ='s";
+
 /// The augmented-assignment operators of the 2.7 grammar, in its order.
 const char *const AugAssignOps[] = {"+=", "-=", "*=", "/=", "%=", "&=", "|=", "^=",
                                     "<<=", ">>=", "**=", "//="};
@@ -180,12 +182,12 @@ Ref ExprStmtOps::getInitialTestExpr(NodeObject *N) const { return child(N, 0); }
 Ref ExprStmtOps::getPostEqualsTestExpr(NodeObject *N, Py_ssize_t EqualNum) const {
   // Position 2 * EqualNum + 2, computed without overflow.
   if (EqualNum > (PY_SSIZE_T_MAX - 2) / 2)
-    tl::raise(PyExc_ValueError, "Not enough ='s");
+    tl::raise(PyExc_ValueError, NotEnoughEquals);
   if (EqualNum < PY_SSIZE_T_MIN / 2)
     tl::raise(PyExc_IndexError, "list index out of range");
   Py_ssize_t Pos = 2 * EqualNum + 2;
   if (Pos >= nodeGetChildCount(N))
-    tl::raise(PyExc_ValueError, "Not enough ='s");
+    tl::raise(PyExc_ValueError, NotEnoughEquals);
   return child(N, Pos);
 }
 
