@@ -434,6 +434,18 @@ class FactoryTest(unittest.TestCase):
         parser.DiscardNode(second[0])
         self.assertEqual(parser._FreeNodeCount(), free)
 
+    def testDiscardTwiceKeepsFreeListsSound(self):
+        parser = Parser('2.7')
+        source = b'x = f(g(a), h(b)) + 1\n'
+        tree = Parse('2.7', source)
+        parser.DiscardNode(tree)
+        free = parser._FreeNodeCount()
+        parser.DiscardNode(tree)
+        self.assertEqual(parser._FreeNodeCount(), free)
+        first = Nodes(Parse('2.7', source))
+        second = Nodes(Parse('2.7', source))
+        self.assertEqual(len(set(id(n) for n in first + second)), len(first) + len(second))
+
     def testClassInfos(self):
         factory = _Factory([tl.CNode] * 258)
         leaf = factory.ConvertSingleNode(1, b'x', 0, None)

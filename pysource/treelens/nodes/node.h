@@ -28,6 +28,7 @@ struct NodeObject {
   PyObject *Context;        ///< parse context: the token index (an int)
   ClassInfoObject *ClsInfo; ///< grammar state of the node
   NodeObject *NextFree;     ///< free-list link while discarded
+  bool OnFreeList;          ///< set while the node is on a free list (not visible from Python)
 };
 
 /// Native implementations of the node operations, one instance per node class

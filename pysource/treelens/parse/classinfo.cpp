@@ -96,6 +96,7 @@ Py_ssize_t drainFreeList(ClassInfoObject *Info) {
   while (NodeObject *N = Info->FirstFree) {
     Info->FirstFree = N->NextFree; // takes over N's reference to its successor
     N->NextFree = nullptr;
+    N->OnFreeList = false;
     Py_DECREF(N);
     ++Count;
   }

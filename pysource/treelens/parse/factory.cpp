@@ -41,6 +41,7 @@ void pushFree(NodeObject *N) {
   ClassInfoObject *Info = N->ClsInfo;
   if (!Info || reinterpret_cast<PyObject *>(Py_TYPE(N)) != Info->Cls)
     return;
+  N->OnFreeList = true;
   NodeObject *Stale = N->NextFree;
   N->NextFree = Info->FirstFree; // takes over the record's reference to the old head
   Py_INCREF(N);
@@ -206,6 +207,7 @@ Ref newNode(ClassInfoObject *Info, PyObject *Value, PyObject *Context, PyObject 
     // (stale) link to its successor, so the new head gets a reference of its own.
     Info->FirstFree = N->NextFree;
     Py_XINCREF(Info->FirstFree);
+    N->OnFreeList = false;
   } else {
     PyObject *Cls = Info->Cls ? Info->Cls : Py_None;
     PyTypeObject *T = PyType_Check(Cls) ? reinterpret_cast<PyTypeObject *>(Cls) : nullptr;
@@ -282,6 +284,10 @@ void discardNodes(PyObject *Node, int Depth) {
   if (!isNode(Node))
     asNode(Node);
   NodeObject *N = reinterpret_cast<NodeObject *>(Node);
+  // A node already on a free list (a tree discarded twice) stays where it is:
+  // pushing it again would hand it out twice.
+  if (N->OnFreeList)
+    return;
   pushFree(N);
   if (!N->Children)
     return;
