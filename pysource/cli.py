@@ -19,11 +19,19 @@ from pysource import utils
 
 kKindNames = {0: 'stmt', 1: 'class', 2: 'def', 11: 'try', 21: 'comment', 22: 'blank'}
 
-# Language version -> (version triple, grammar file, is a Python 3 grammar).
+# Keywords of Python 3.5 and 3.6 (async and await are handled by the parser).
+kPy3Keywords = (
+    'False', 'None', 'True', 'and', 'as', 'assert', 'break', 'class', 'continue',
+    'def', 'del', 'elif', 'else', 'except', 'finally', 'for', 'from', 'global',
+    'if', 'import', 'in', 'is', 'lambda', 'nonlocal', 'not', 'or', 'pass',
+    'raise', 'return', 'try', 'while', 'with', 'yield')
+
+# Language version -> (version triple, grammar file, is a Python 3 grammar,
+# keywords; None for the interpreter's own list).
 kLanguages = {
-    '2.7': ((2, 7, 0), 'Python-Grammar-2.7', False),
-    '3.5': ((3, 5, 0), 'Python-Grammar-3.5', True),
-    '3.6': ((3, 6, 0), 'Python-Grammar-3.6', True),
+    '2.7': ((2, 7, 0), 'Python-Grammar-2.7', False, None),
+    '3.5': ((3, 5, 0), 'Python-Grammar-3.5', True, kPy3Keywords),
+    '3.6': ((3, 6, 0), 'Python-Grammar-3.6', True, kPy3Keywords),
 }
 
 
@@ -94,8 +102,8 @@ def MakeAnalyzer(lang):
         from pysource import treelens
     except ImportError:
         return None
-    triple, grammar, py3 = kLanguages[lang]
-    return treelens.CPGenAnalyzerImpl(triple, grammar, None, py3, grammar)
+    triple, grammar, py3, keywords = kLanguages[lang]
+    return treelens.CPGenAnalyzerImpl(triple, grammar, keywords, py3, grammar)
 
 
 def Main(argv=None):
