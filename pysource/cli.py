@@ -39,11 +39,12 @@ def IterSourceFiles(paths):
     """Yields the .py files named by paths, folders searched in sorted order."""
     for path in paths:
         if os.path.isdir(path):
+            found = []
             for dirpath, dirnames, filenames in os.walk(path):
-                dirnames.sort()
-                for name in sorted(filenames):
-                    if name.endswith('.py'):
-                        yield os.path.join(dirpath, name)
+                found.extend(os.path.join(dirpath, name) for name in filenames
+                             if name.endswith('.py'))
+            for name in sorted(found, key=lambda p: p.split(os.sep)):
+                yield name
         else:
             yield path
 
@@ -61,23 +62,22 @@ def InAsyncDef(logical):
 
 
 def _Text(logical):
-    return logical.fLineText.rstrip(b'\r\n').decode('utf-8', 'replace')
+    return logical.fLineText.rstrip(b'\r\n').split(b'\n')[0].rstrip(b'\r')
 
 
 def _Show(values):
     out = []
     for v in values:
         if isinstance(v, tuple):
-            out.append('%s=%s' % tuple(x.decode('utf-8', 'replace') if isinstance(x, bytes)
-                                       else repr(x) for x in v))
+            out.append(b'='.join(x if isinstance(x, bytes) else repr(x) for x in v))
         else:
-            out.append(v.decode('utf-8', 'replace') if isinstance(v, bytes) else repr(v))
-    return ', '.join(out)
+            out.append(v if isinstance(v, bytes) else repr(v))
+    return b', '.join(out)
 
 
 def PrintSplit(logical, out):
     print('%5d  %-7s %s' % (logical.fFirstLine + 1, kKindNames.get(logical.fKind, logical.fKind),
-                            _Text(logical).split('\n')[0]), file=out)
+                            _Text(logical)), file=out)
     if logical.fTokenCount:
         print('       tokens: %s' % ' '.join(repr(t) for t, _ in logical.fTokens), file=out)
 
