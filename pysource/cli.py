@@ -28,6 +28,8 @@ kPy3Keywords = (
 
 # Language version -> (version triple, grammar file, is a Python 3 grammar,
 # keywords; None for the interpreter's own list).
+kPrintFunctionGrammar = 'Python-Grammar-2.7-print-function'
+
 kLanguages = {
     '2.7': ((2, 7, 0), 'Python-Grammar-2.7', False, None),
     '3.5': ((3, 5, 0), 'Python-Grammar-3.5', True, kPy3Keywords),
@@ -47,6 +49,21 @@ def IterSourceFiles(paths):
                 yield name
         else:
             yield path
+
+
+def UsesPrintFunction(logicals):
+    """True when a module imports print_function from __future__.
+
+    Python 2.7 then parses the whole module without the print statement; the
+    analyzer needs the grammar variant that has none.
+    """
+    for logical in logicals:
+        if logical.fKind in (21, 22) or logical.fTokenCount < 4:
+            continue
+        texts = [logical.GetTokenString(i) for i in range(logical.fTokenCount)]
+        if texts[:3] == [b'from', b'__future__', b'import'] and b'print_function' in texts:
+            return True
+    return False
 
 
 def InAsyncDef(logical):
@@ -96,14 +113,36 @@ def PrintAnalysis(logical, error, out):
             print('       %s: %s' % (label, _Show(values)), file=out)
 
 
-def MakeAnalyzer(lang):
-    """The analyzer for a language version, or None when the module is not built."""
+def MakeAnalyzer(lang, print_function=False):
+    """The analyzer for a language version, or None when the module is not built.
+
+    With print_function (2.7 only), the analyzer for modules that import it.
+    """
     try:
         from pysource import treelens
     except ImportError:
         return None
     triple, grammar, py3, keywords = kLanguages[lang]
+    if print_function and not py3:
+        import keyword
+        grammar = kPrintFunctionGrammar
+        keywords = [k for k in keyword.kwlist if k != 'print']
     return treelens.CPGenAnalyzerImpl(triple, grammar, keywords, py3, grammar)
+
+
+class Analyzers(object):
+    """The analyzers of one language version, made when first needed."""
+
+    def __init__(self, lang):
+        self._lang = lang
+        self._made = {}
+
+    def ForModule(self, logicals):
+        """The analyzer for a module's logicals; None when the module is not built."""
+        key = self._lang == '2.7' and UsesPrintFunction(logicals)
+        if key not in self._made:
+            self._made[key] = MakeAnalyzer(self._lang, key)
+        return self._made[key]
 
 
 def Main(argv=None):
@@ -114,7 +153,7 @@ def Main(argv=None):
     parser.add_argument('--split-only', action='store_true',
                         help='only split into logical lines and tokens')
     args = parser.parse_args(argv)
-    analyzer = None if args.split_only else MakeAnalyzer(args.lang)
+    analyzers = None if args.split_only else Analyzers(args.lang)
     out = sys.stdout
     status = 0
     for path in IterSourceFiles(args.paths):
@@ -126,7 +165,9 @@ def Main(argv=None):
             status = 1
             continue
         print('== %s' % path, file=out)
-        for logical in utils.GetLogicalsFromText(text):
+        logicals = utils.GetLogicalsFromText(text)
+        analyzer = analyzers.ForModule(logicals) if analyzers else None
+        for logical in logicals:
             if analyzer is None:
                 PrintSplit(logical, out)
             elif logical.fKind == 22:

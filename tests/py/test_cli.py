@@ -76,6 +76,19 @@ class CliTest(unittest.TestCase):
         self.assertIn('cannot read', err.getvalue())
         self.assertIn('== ' + good, out)
 
+    def testPrintFunctionModulesUseTheVariantGrammar(self):
+        body = b'print(x, file=f)\nprint >>f, x\n'
+        path = self.Write('future.py', b'from __future__ import print_function\n' + body)
+        status, out = self.Run(path)
+        lines = [l for l in out.splitlines() if l.startswith('       error')]
+        self.assertEqual(lines, [], out)      # `print >>f, x` is a shift expression there
+        path = self.Write('plain.py', body)
+        status, out = self.Run(path)
+        lines = [l for l in out.splitlines() if l.startswith('       error')]
+        self.assertEqual(len(lines), 1, out)      # only the print call with a keyword fails
+        status, out = self.Run('--lang', '3.6', path)
+        self.assertEqual(out.count('error: invalid syntax'), 1, out)
+
     def testAsyncDefScopeFromParents(self):
         from pysource import utils
         logicals = utils.GetLogicalsFromText(
