@@ -87,7 +87,7 @@ class CliTest(unittest.TestCase):
         lines = [l for l in out.splitlines() if l.startswith('       error')]
         self.assertEqual(len(lines), 1, out)      # only the print call with a keyword fails
         status, out = self.Run('--lang', '3.6', path)
-        self.assertEqual(out.count('error: invalid syntax'), 1, out)
+        self.assertNotIn('error:', out)       # both are expressions in Python 3
 
     def testAsyncDefScopeFromParents(self):
         from pysource import utils
