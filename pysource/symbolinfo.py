@@ -294,7 +294,7 @@ def _WouldMerge(left, right):
     return _Lex(left + right) != [left, right]
 
 
-def JoinTokens(texts):
+def _JoinTokensPy(texts):
     """Source text from token texts, with conventional spacing.
 
     f(x, 1), a.b[i], x + 1, -x, f(*a, **kw), lambda x: x, a[1:2], {a: b},
@@ -373,6 +373,12 @@ def JoinTokens(texts):
         dots = dots + 1 if cls == _DOT else 0
         prev, prev_cls, prev_unary, prev_tight = tok, cls, unary, tight
     return ''.join(out)
+
+
+try:
+    from pysource._fastaccess import JoinTokens
+except ImportError:
+    JoinTokens = _JoinTokensPy
 
 
 # -- Value classes -------------------------------------------------------------

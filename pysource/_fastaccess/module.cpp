@@ -1,5 +1,6 @@
 // Module pysource._fastaccess: record operations, tokenizer functions and the native API capsule.
 #include "pysource/_fastaccess/internal.h"
+#include "pysource/_fastaccess/jointokens.h"
 #include "pysource/_fastaccess/records.h"
 
 #include "typedesc.h"
@@ -126,6 +127,9 @@ PyMethodDef Functions[] = {
      "The offset just past the string literal that starts at pos (its prefix or\n"
      "opening quote), or len(text) when it is unterminated. Quotes inside f-string\n"
      "replacement fields do not nest. ValueError when no literal starts at pos."},
+    {"JoinTokens", reinterpret_cast<PyCFunction>(reinterpret_cast<void (*)()>(f_join_tokens)),
+     METH_VARARGS | METH_KEYWORDS,
+     "JoinTokens(texts) -> bytes: the token texts joined into source text with conventional spacing."},
     {"_ClearLogicalFreeList", f_clear_free_list, METH_NOARGS,
      "_ClearLogicalFreeList() -> int: frees the dead records kept for reuse, returns their number."},
     {"_SplitLogicals", f_split, METH_O,
