@@ -197,7 +197,9 @@ size_t tokenEnd(const char *S, size_t Len, size_t P) {
 struct Token {
   const char *Text;
   size_t Len;
-  bool is(const char *Lit) const { return Len == strlen(Lit) && memcmp(Text, Lit, Len) == 0; }
+  template <size_t N> bool is(const char (&Lit)[N]) const {
+    return Len == N - 1 && memcmp(Text, Lit, N - 1) == 0;
+  }
   bool is(char C) const { return Len == 1 && Text[0] == C; }
 };
 
@@ -219,20 +221,36 @@ void lex(const char *S, size_t Len, std::vector<Token> &Out) {
 
 enum Class { Operand, Keyword, Open, Close, Comma, Colon, Dot, Op, NoClass };
 
-const char *const kKeywords[] = {
-    "and",    "as",   "assert", "async",  "await",    "break",  "class",  "continue",
-    "def",    "del",  "elif",   "else",   "except",   "finally", "for",   "from",
-    "global", "if",   "import", "in",     "is",       "lambda", "nonlocal", "not",
-    "or",     "pass", "raise",  "return", "try",      "while",  "with",   "yield"};
+struct Word {
+  const char *Text;
+  size_t Len;
+};
+
+#define TL_WORD(W) Word{W, sizeof(W) - 1}
+const Word kKeywords[] = {
+    TL_WORD("and"),    TL_WORD("as"),     TL_WORD("assert"), TL_WORD("async"),
+    TL_WORD("await"),  TL_WORD("break"),  TL_WORD("class"),  TL_WORD("continue"),
+    TL_WORD("def"),    TL_WORD("del"),    TL_WORD("elif"),   TL_WORD("else"),
+    TL_WORD("except"), TL_WORD("finally"), TL_WORD("for"),   TL_WORD("from"),
+    TL_WORD("global"), TL_WORD("if"),     TL_WORD("import"), TL_WORD("in"),
+    TL_WORD("is"),     TL_WORD("lambda"), TL_WORD("nonlocal"), TL_WORD("not"),
+    TL_WORD("or"),     TL_WORD("pass"),   TL_WORD("raise"),  TL_WORD("return"),
+    TL_WORD("try"),    TL_WORD("while"),  TL_WORD("with"),   TL_WORD("yield")};
+#undef TL_WORD
+
+bool isKeyword(const Token &T) {
+  if (T.Len < 2 || T.Len > 8 || T.Text[0] < 'a' || T.Text[0] > 'y')
+    return false;
+  for (const Word &K : kKeywords)
+    if (K.Len == T.Len && K.Text[0] == T.Text[0] && memcmp(K.Text, T.Text, T.Len) == 0)
+      return true;
+  return false;
+}
 
 Class classOf(const Token &T) {
   const char C = T.Text[0];
-  if (isIdStart(C)) {
-    for (const char *K : kKeywords)
-      if (T.is(K))
-        return Keyword;
-    return Operand;
-  }
+  if (isIdStart(C))
+    return isKeyword(T) ? Keyword : Operand;
   if (isDigit(C) || isQuote(C) || (C == '.' && T.Len > 1))
     return Operand;
   if (C == '(' || C == '[' || C == '{')
@@ -277,6 +295,10 @@ char openFor(char Close) { return Close == ')' ? '(' : Close == ']' ? '[' : Clos
 
 std::string join(const std::vector<Token> &Toks) {
   std::string Out;
+  size_t Size = 0;
+  for (const Token &Tok : Toks)
+    Size += Tok.Len + 1;
+  Out.reserve(Size);
   std::string Scratch;
   std::vector<Level> Stack{Level{0, 0}};
   const Token *Prev = nullptr;
@@ -361,13 +383,21 @@ const char *shortTypeName(PyObject *O) {
   return Name;
 }
 
-/// The bytes of a text: bytes as they are, unicode encoded as UTF-8.
-tl::Ref textBytes(PyObject *O) {
-  if (PyString_Check(O))
-    return tl::Ref::borrow(O);
-  if (PyUnicode_Check(O))
-    return tl::require(PyUnicode_AsUTF8String(O));
-  tl::raiseFormat(PyExc_TypeError, "Expected %.16s, got %.200s", "bytes", shortTypeName(O));
+/// Lexes one text: bytes as they are, unicode encoded as UTF-8. Held keeps
+/// the bytes the tokens point into alive unless Item is kept alive elsewhere
+/// (Borrowed).
+void lexItem(PyObject *Item, bool Borrowed, std::vector<Token> &Toks, std::vector<tl::Ref> &Held) {
+  PyObject *Bytes = Item;
+  if (PyString_Check(Item)) {
+    if (!Borrowed)
+      Held.push_back(tl::Ref::borrow(Item));
+  } else if (PyUnicode_Check(Item)) {
+    Held.push_back(tl::require(PyUnicode_AsUTF8String(Item)));
+    Bytes = Held.back().get();
+  } else {
+    tl::raiseFormat(PyExc_TypeError, "Expected %.16s, got %.200s", "bytes", shortTypeName(Item));
+  }
+  lex(PyString_AS_STRING(Bytes), static_cast<size_t>(PyString_GET_SIZE(Bytes)), Toks);
 }
 
 /// The one argument, texts, given by position or by keyword; the errors are
@@ -401,17 +431,24 @@ PyObject *textsArg(PyObject *Args, PyObject *Kw) {
 PyObject *f_join_tokens(PyObject *, PyObject *Args, PyObject *Kw) {
   return tl::guard<PyObject *>(nullptr, [&]() -> PyObject * {
     PyObject *Texts = textsArg(Args, Kw);
-    tl::Ref Iter = tl::require(PyObject_GetIter(Texts));
     std::vector<tl::Ref> Held;
     std::vector<Token> Toks;
-    while (PyObject *Item = PyIter_Next(Iter.get())) {
-      tl::Ref Owned = tl::Ref::steal(Item);
-      tl::Ref Bytes = textBytes(Item);
-      lex(PyString_AS_STRING(Bytes.get()), static_cast<size_t>(PyString_GET_SIZE(Bytes.get())), Toks);
-      Held.push_back(std::move(Bytes));
+    Toks.reserve(32);
+    if (PyList_CheckExact(Texts) || PyTuple_CheckExact(Texts)) {
+      // No Python code runs while lexing, so the sequence keeps its items.
+      const Py_ssize_t N = PySequence_Fast_GET_SIZE(Texts);
+      PyObject **Items = PySequence_Fast_ITEMS(Texts);
+      for (Py_ssize_t I = 0; I < N; ++I)
+        lexItem(Items[I], true, Toks, Held);
+    } else {
+      tl::Ref Iter = tl::require(PyObject_GetIter(Texts));
+      while (PyObject *Item = PyIter_Next(Iter.get())) {
+        tl::Ref Owned = tl::Ref::steal(Item);
+        lexItem(Item, false, Toks, Held);
+      }
+      if (PyErr_Occurred())
+        throw tl::PyErrSet();
     }
-    if (PyErr_Occurred())
-      throw tl::PyErrSet();
     const std::string Out = join(Toks);
     return PyString_FromStringAndSize(Out.data(), static_cast<Py_ssize_t>(Out.size()));
   });
