@@ -145,6 +145,7 @@ std::unique_ptr<Grammar> Grammar::compile(const GrammarSource &Src,
         Error = "keyword has no token label: " + K.first;
         return nullptr;
       }
+      G->KeywordLengths |= uint64_t(1) << lengthBit(K.first.size());
       uint32_t H = hashText(K.first.data(), K.first.size());
       size_t I = H & (Cap - 1);
       while (G->KeywordSlots[I].Label >= 0) {

@@ -84,7 +84,8 @@ public:
 
   /// Label of a token, or -1 when the grammar has none for it.
   int classify(int Type, const char *Text, size_t Len) const {
-    if (Type == NameTokenType && Text && !KeywordSlots.empty()) {
+    if (Type == NameTokenType && Text &&
+        ((KeywordLengths >> lengthBit(Len)) & 1)) {
       int L = keywordLabel(Text, Len);
       if (L >= 0)
         return L;
@@ -149,6 +150,12 @@ private:
   size_t TerminalCount = 0;
   int32_t TokenLabels[256];
   std::vector<KeywordSlot> KeywordSlots; ///< open addressing, power of 2
+  /// Bit lengthBit(N) is set when some keyword has N bytes: most names skip
+  /// the hash.
+  uint64_t KeywordLengths = 0;
+  static unsigned lengthBit(size_t Len) {
+    return Len < 63 ? static_cast<unsigned>(Len) : 63;
+  }
   std::string KeywordText;
   size_t LabelCount = 0;
   int Start = 0;

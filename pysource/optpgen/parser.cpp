@@ -474,19 +474,32 @@ inline void prefetch(const void *P) {
 #endif
 }
 
-/// Token tuples and their objects are scattered over the heap: fetches the
-/// tuple two tokens ahead and the value and context of the next one, so
-/// their loads overlap the parse of the current token.
-inline void prefetchTokens(PyObject **Items, Py_ssize_t I, Py_ssize_t N) {
-  if (I + 2 < N)
-    prefetch(Items[I + 2]);
-  if (I + 1 < N) {
-    PyObject *Next = Items[I + 1];
-    if (PyTuple_CheckExact(Next) && PyTuple_GET_SIZE(Next) == 3) {
-      prefetch(PyTuple_GET_ITEM(Next, 1));
-      prefetch(PyTuple_GET_ITEM(Next, 2));
-    }
+/// Token tuples and their objects are scattered over the heap. The feed
+/// keeps the tuples TupleAhead tokens ahead and the values and contexts of
+/// those ItemsAhead tokens ahead (their tuples fetched earlier) loading while
+/// it parses, and starts with the whole first window, as most lines are
+/// short.
+constexpr Py_ssize_t TupleAhead = 8, ItemsAhead = 4;
+
+inline void prefetchItems(PyObject *T) {
+  if (PyTuple_CheckExact(T) && PyTuple_GET_SIZE(T) == 3) {
+    prefetch(PyTuple_GET_ITEM(T, 1));
+    prefetch(PyTuple_GET_ITEM(T, 2));
   }
+}
+
+inline void prefetchFirst(PyObject **Items, Py_ssize_t N) {
+  for (Py_ssize_t I = 0; I < N && I < TupleAhead; ++I)
+    prefetch(Items[I]);
+  for (Py_ssize_t I = 0; I < N && I < ItemsAhead; ++I)
+    prefetchItems(Items[I]);
+}
+
+inline void prefetchNext(PyObject **Items, Py_ssize_t I, Py_ssize_t N) {
+  if (I + TupleAhead < N)
+    prefetch(Items[I + TupleAhead]);
+  if (I + ItemsAhead < N)
+    prefetchItems(Items[I + ItemsAhead]);
 }
 
 } // namespace
@@ -494,15 +507,22 @@ inline void prefetchTokens(PyObject **Items, Py_ssize_t I, Py_ssize_t N) {
 PyObject *feedTokens(PyObject *, PyObject *Args) {
   return guard<PyObject *>(nullptr, [&]() -> PyObject * {
     PyObject *Self, *Tokens;
-    if (!PyArg_ParseTuple(Args, "O!O:_FeedTokens", &ParserType, &Self, &Tokens))
+    if (PyTuple_GET_SIZE(Args) == 2 &&
+        Py_TYPE(PyTuple_GET_ITEM(Args, 0)) == &ParserType) {
+      Self = PyTuple_GET_ITEM(Args, 0);
+      Tokens = PyTuple_GET_ITEM(Args, 1);
+    } else if (!PyArg_ParseTuple(Args, "O!O:_FeedTokens", &ParserType, &Self,
+                                 &Tokens)) {
       throw tl::PyErrSet();
+    }
     Ref Seq = require(PySequence_Fast(Tokens, "tokens must be a sequence"));
     setupParser(Self, Py_None);
     Ref Result = Ref::borrow(Py_False);
     PyObject **Items = PySequence_Fast_ITEMS(Seq.get());
-    for (Py_ssize_t I = 0, N = PySequence_Fast_GET_SIZE(Seq.get()); I < N;
-         ++I) {
-      prefetchTokens(Items, I, N);
+    const Py_ssize_t N = PySequence_Fast_GET_SIZE(Seq.get());
+    prefetchFirst(Items, N);
+    for (Py_ssize_t I = 0; I < N; ++I) {
+      prefetchNext(Items, I, N);
       PyObject *T = Items[I];
       if (!PyTuple_Check(T) || PyTuple_GET_SIZE(T) != 3)
         tl::expectType(false, "a (type, value, context) tuple", T);

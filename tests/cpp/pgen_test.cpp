@@ -127,6 +127,27 @@ TEST(PgenGrammar, ManyKeywordsHash) {
   EXPECT_EQ(LName, G->classify(NAME, "print", 5));
 }
 
+TEST(PgenGrammar, KeywordsOfEveryLength) {
+  // Names are hashed only at lengths some keyword has; lengths from 63 on
+  // share one mark.
+  GrammarSource S = tinySource();
+  const std::string Long63(63, 'k'), Long70(70, 'k'), Long80(80, 'k');
+  S.Keywords.emplace_back(Long70, LPrint);
+  S.Keywords.emplace_back("", LPrint);
+  std::string Error;
+  auto G = Grammar::compile(S, Error);
+  ASSERT_TRUE(G) << Error;
+  const struct {
+    std::string Text;
+    int Label;
+  } Cases[] = {{Long70, LPrint}, {Long63, LName}, {Long80, LName},
+               {"", LPrint},     {"print", LPrint}, {"x", LName},
+               {std::string(62, 'k'), LName}};
+  for (const auto &C : Cases)
+    EXPECT_EQ(C.Label, G->classify(NAME, C.Text.data(), C.Text.size()))
+        << C.Text.size() << " bytes";
+}
+
 TEST(PgenGrammar, RejectsMalformedSources) {
   struct Case {
     const char *Name;
