@@ -183,15 +183,21 @@ std::unique_ptr<Grammar> Grammar::compile(const GrammarSource &Src,
   for (size_t S = 0; S < G->States.size(); ++S)
     G->AcceptOnlyStates[S] = G->States[S].AcceptOnly;
   G->Pool.assign(MoveFirst, 0);
+  MoveIndex Index;
   G->Moves.assign(G->States.size() * G->TerminalCount, MoveError);
   for (size_t S = 0; S < G->States.size(); ++S) {
     for (size_t T = 0; T < G->TerminalCount; ++T)
       G->Moves[S * G->TerminalCount + T] =
-          G->buildMove(static_cast<uint32_t>(S), TerminalLabels[T]);
+          G->buildMove(static_cast<uint32_t>(S), TerminalLabels[T], Index);
     if (G->Pool.size() > MaxMoves) {
       Error = "grammar is too large";
       return nullptr;
     }
+  }
+
+  if (G->Pool.size() <= UINT16_MAX) {
+    G->NarrowMoves.assign(G->Moves.begin(), G->Moves.end());
+    std::vector<uint32_t>().swap(G->Moves);
   }
 
   if (G->dfaOfSymbol(Src.Start) < 0) {
@@ -212,7 +218,7 @@ const Grammar::Arc *Grammar::firstArc(uint32_t S, uint32_t L) const {
   return nullptr;
 }
 
-uint32_t Grammar::buildMove(uint32_t S, uint32_t L) {
+uint32_t Grammar::buildMove(uint32_t S, uint32_t L, MoveIndex &Index) {
   const Arc *A = firstArc(S, L);
   if (!A)
     return States[S].CanAccept ? MovePop : MoveError;
@@ -240,6 +246,13 @@ uint32_t Grammar::buildMove(uint32_t S, uint32_t L) {
     }
   }
   Pool[M] = Header | Pushes;
+  // Moves of states that share their arcs repeat: keep one copy.
+  std::vector<uint32_t> Key(Pool.begin() + M, Pool.end());
+  auto Found = Index.emplace(std::move(Key), M);
+  if (!Found.second) {
+    Pool.resize(M);
+    return Found.first->second;
+  }
   return M;
 }
 
@@ -247,7 +260,7 @@ size_t Grammar::tableBytes() const {
   return sizeof(*this) + Arcs.size() * sizeof(Arc) +
          States.size() * sizeof(State) + Dfas.size() * sizeof(Dfa) +
          FirstBits.size() * 8 + SymbolDfas.size() * 4 + Terminals.size() * 4 +
-         Moves.size() * 4 + Pool.size() * 4 + AcceptOnlyStates.size() +
+         Moves.size() * 4 + NarrowMoves.size() * 2 + Pool.size() * 4 + AcceptOnlyStates.size() +
          KeywordSlots.size() * sizeof(KeywordSlot) + KeywordText.size();
 }
 

@@ -6,6 +6,7 @@
 #include <cstddef>
 #include <cstdint>
 #include <memory>
+#include <map>
 #include <string>
 #include <utility>
 #include <vector>
@@ -100,7 +101,8 @@ public:
 
   /// What state S does on terminal T: MoveError, MovePop or a pool offset.
   uint32_t move(uint32_t S, uint32_t T) const {
-    return Moves[static_cast<size_t>(S) * TerminalCount + T];
+    size_t I = static_cast<size_t>(S) * TerminalCount + T;
+    return NarrowMoves.empty() ? Moves[I] : NarrowMoves[I];
   }
   const uint32_t *movePool(uint32_t M) const { return &Pool[M]; }
   bool acceptOnly(uint32_t S) const { return AcceptOnlyStates[S] != 0; }
@@ -129,8 +131,11 @@ private:
   int keywordLabel(const char *Text, size_t Len) const;
   /// First arc of state S that takes label L, directly or by a push.
   const Arc *firstArc(uint32_t S, uint32_t L) const;
-  /// Appends the move of state S on label L to Pool; its move() value.
-  uint32_t buildMove(uint32_t S, uint32_t L);
+  /// Pool offset of each distinct move, while compiling.
+  using MoveIndex = std::map<std::vector<uint32_t>, uint32_t>;
+  /// Appends the move of state S on label L to Pool, or finds the same
+  /// move there; its move() value.
+  uint32_t buildMove(uint32_t S, uint32_t L, MoveIndex &Index);
 
   struct KeywordSlot {
     uint32_t Hash;
@@ -145,6 +150,9 @@ private:
   std::vector<int32_t> SymbolDfas; ///< symbol - 256 -> DFA index or -1
   std::vector<uint32_t> Terminals; ///< label -> terminal index (symbols: 0)
   std::vector<uint32_t> Moves;     ///< [state][terminal], see move()
+  /// Moves in 16 bits when the pool allows it (then Moves is empty): the
+  /// table is read for every token, so half the cache lines matter.
+  std::vector<uint16_t> NarrowMoves;
   std::vector<uint32_t> Pool;      ///< the moves' pushes
   std::vector<uint8_t> AcceptOnlyStates;
   size_t TerminalCount = 0;
