@@ -260,8 +260,8 @@ size_t Grammar::tableBytes() const {
   return sizeof(*this) + Arcs.size() * sizeof(Arc) +
          States.size() * sizeof(State) + Dfas.size() * sizeof(Dfa) +
          FirstBits.size() * 8 + SymbolDfas.size() * 4 + Terminals.size() * 4 +
-         Moves.size() * 4 + NarrowMoves.size() * 2 + Pool.size() * 4 + AcceptOnlyStates.size() +
-         KeywordSlots.size() * sizeof(KeywordSlot) + KeywordText.size();
+         Moves.size() * 4 + NarrowMoves.size() * 2 + Pool.size() * 4 +
+         AcceptOnlyStates.size() + KeywordSlots.size() * sizeof(KeywordSlot) + KeywordText.size();
 }
 
 int Grammar::keywordLabel(const char *Text, size_t Len) const {
