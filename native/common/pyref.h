@@ -66,6 +66,9 @@ inline int requireStatus(int Status) {
   return Status;
 }
 
+/// Python truth of O; throws PyErrSet when the test raises.
+inline bool isTrue(PyObject *O) { return requireStatus(PyObject_IsTrue(O)) != 0; }
+
 /// Sets a Python exception and throws PyErrSet.
 [[noreturn]] inline void raise(PyObject *Type, const char *Message) {
   PyErr_SetString(Type, Message);

@@ -29,6 +29,13 @@ struct TypeDesc {
   Py_ssize_t WeakListOffset = 0;
 };
 
+/// tp_dealloc of a GC type whose tp_clear releases every field it owns.
+template <inquiry Clear> void gcDealloc(PyObject *Self) {
+  PyObject_GC_UnTrack(Self);
+  Clear(Self);
+  Py_TYPE(Self)->tp_free(Self);
+}
+
 /// Fills T from D and calls PyType_Ready; -1 with an exception on failure.
 TL_HIDDEN int readyType(PyTypeObject &T, const TypeDesc &D);
 

@@ -218,14 +218,6 @@ int analyzer_clear(PyObject *Self) {
   return 0;
 }
 
-void analyzer_dealloc(PyObject *Self) {
-  PyObject_GC_UnTrack(Self);
-  analyzer_clear(Self);
-  Py_TYPE(Self)->tp_free(Self);
-}
-
-bool truth(PyObject *O) { return tl::requireStatus(PyObject_IsTrue(O)) != 0; }
-
 PyObject *analyzer_AnalyzeSingleLogical(PyObject *Self, PyObject *Args, PyObject *Kwds) {
   return tl::guard<PyObject *>(nullptr, [&] {
     static const char *Keywords[] = {"logical", "in_async_def", nullptr};
@@ -238,7 +230,7 @@ PyObject *analyzer_AnalyzeSingleLogical(PyObject *Self, PyObject *Args, PyObject
                                             const_cast<char **>(Keywords), &Logical, &InAsyncDef)) {
       throw tl::PyErrSet();
     }
-    return analyzeSingleLogical(self(Self), Logical, truth(InAsyncDef)).release();
+    return analyzeSingleLogical(self(Self), Logical, tl::isTrue(InAsyncDef)).release();
   });
 }
 
@@ -249,7 +241,7 @@ PyObject *analyzer_InspectSingleLogical(PyObject *Self, PyObject *Args, PyObject
     if (!PyArg_ParseTupleAndKeywords(Args, Kwds, "OO|O:_InspectSingleLogical", const_cast<char **>(Keywords),
                                      &Logical, &InAsyncDef, &InFString))
       throw tl::PyErrSet();
-    inspectSingleLogical(self(Self), Logical, truth(InAsyncDef), truth(InFString));
+    inspectSingleLogical(self(Self), Logical, tl::isTrue(InAsyncDef), tl::isTrue(InFString));
     Py_RETURN_TRUE;
   });
 }
@@ -262,7 +254,7 @@ PyObject *analyzer_ParseToNode(PyObject *Self, PyObject *Args, PyObject *Kwds) {
                                      &InAsyncDef))
       throw tl::PyErrSet();
     requireReady(self(Self));
-    return parseToNode(self(Self)->LogicalParser, Logical, truth(InAsyncDef)).release();
+    return parseToNode(self(Self)->LogicalParser, Logical, tl::isTrue(InAsyncDef)).release();
   });
 }
 
@@ -275,7 +267,7 @@ PyObject *analyzer_ParseTokenListToNode(PyObject *Self, PyObject *Args, PyObject
       throw tl::PyErrSet();
     tl::expectType(PyList_Check(TokList), "list", TokList);
     requireReady(self(Self));
-    return parseTokenListToNode(self(Self)->LogicalParser, TokList, truth(InAsyncDef)).release();
+    return parseTokenListToNode(self(Self)->LogicalParser, TokList, tl::isTrue(InAsyncDef)).release();
   });
 }
 
@@ -416,7 +408,7 @@ int initAnalyzerType(PyObject *Module) {
     D.Flags = Py_TPFLAGS_DEFAULT;
     D.Methods = AnalyzerMethods;
     D.GetSets = AnalyzerGetSets;
-    D.Dealloc = analyzer_dealloc;
+    D.Dealloc = tl::gcDealloc<analyzer_clear>;
     D.Traverse = analyzer_traverse;
     D.Clear = analyzer_clear;
     D.Init = analyzer_init;

@@ -37,12 +37,6 @@ int asname_clear(PyObject *Self) {
   return 0;
 }
 
-void asname_dealloc(PyObject *Self) {
-  PyObject_GC_UnTrack(Self);
-  asname_clear(Self);
-  Py_TYPE(Self)->tp_free(Self);
-}
-
 int arginfo_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
   static const char *Keywords[] = {nullptr};
   if (!PyArg_ParseTupleAndKeywords(Args, Kwds, ":CArgInfo", const_cast<char **>(Keywords)))
@@ -71,12 +65,6 @@ int arginfo_clear(PyObject *Self) {
   Py_CLEAR(A->Prefix);
   Py_CLEAR(A->TypeExpr);
   return 0;
-}
-
-void arginfo_dealloc(PyObject *Self) {
-  PyObject_GC_UnTrack(Self);
-  arginfo_clear(Self);
-  Py_TYPE(Self)->tp_free(Self);
 }
 
 /// The field of an ArgInfoObject a getset row stands for, and its type.
@@ -148,7 +136,7 @@ int initNodeRecordTypes(PyObject *Module) {
     D.Name = "pysource.treelens.CAsName";
     D.Doc = "Plain data class for imported names";
     D.Size = sizeof(AsNameObject);
-    D.Dealloc = asname_dealloc;
+    D.Dealloc = tl::gcDealloc<asname_clear>;
     D.Traverse = asname_traverse;
     D.Clear = asname_clear;
     D.Init = asname_init;
@@ -165,7 +153,7 @@ int initNodeRecordTypes(PyObject *Module) {
     D.Doc = "Plain data class for one argument of a definition or a call";
     D.Size = sizeof(ArgInfoObject);
     D.GetSets = ArgInfoGetSets;
-    D.Dealloc = arginfo_dealloc;
+    D.Dealloc = tl::gcDealloc<arginfo_clear>;
     D.Traverse = arginfo_traverse;
     D.Clear = arginfo_clear;
     D.Init = arginfo_init;

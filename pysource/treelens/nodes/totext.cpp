@@ -345,7 +345,7 @@ Ref textForStringLiteral(PyObject *Conv, PyObject *Node) {
 
 namespace {
 
-bool truthArg(PyObject *O, bool Default) { return O ? tl::requireStatus(PyObject_IsTrue(O)) != 0 : Default; }
+bool truthArg(PyObject *O, bool Default) { return O ? tl::isTrue(O) : Default; }
 
 /// Reads the three keyword options that follow the leading arguments.
 TextOptions optionsArgs(PyObject *DottedNameOnly, PyObject *DiscardSimpleParens, PyObject *LiteralOnly) {

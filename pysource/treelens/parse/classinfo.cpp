@@ -58,12 +58,6 @@ int info_clear(PyObject *Self) {
   return 0;
 }
 
-void info_dealloc(PyObject *Self) {
-  PyObject_GC_UnTrack(Self);
-  info_clear(Self);
-  Py_TYPE(Self)->tp_free(Self);
-}
-
 PyObject *orNone(PyObject *O) {
   O = O ? O : Py_None;
   Py_INCREF(O);
@@ -133,7 +127,7 @@ int initClassInfoType(PyObject *Module) {
             "and the head of the state's free list of discarded nodes.";
     D.Size = sizeof(ClassInfoObject);
     D.GetSets = InfoGetSets;
-    D.Dealloc = info_dealloc;
+    D.Dealloc = tl::gcDealloc<info_clear>;
     D.Traverse = info_traverse;
     D.Clear = info_clear;
     D.Init = info_init;

@@ -452,14 +452,6 @@ int parser_clear(PyObject *Self) {
   return 0;
 }
 
-void parser_dealloc(PyObject *Self) {
-  PyObject_GC_UnTrack(Self);
-  parser_clear(Self);
-  Py_TYPE(Self)->tp_free(Self);
-}
-
-bool truth(PyObject *O) { return tl::requireStatus(PyObject_IsTrue(O)) != 0; }
-
 PyObject *parser_ParseToNode(PyObject *Self, PyObject *Args, PyObject *Kwds) {
   return tl::guard<PyObject *>(nullptr, [&] {
     static const char *Keywords[] = {"logical", "in_async_def", nullptr};
@@ -467,7 +459,7 @@ PyObject *parser_ParseToNode(PyObject *Self, PyObject *Args, PyObject *Kwds) {
     if (!PyArg_ParseTupleAndKeywords(Args, Kwds, "OO:ParseToNode", const_cast<char **>(Keywords), &Logical,
                                      &InAsyncDef))
       throw tl::PyErrSet();
-    return parseToNode(self(Self), Logical, truth(InAsyncDef)).release();
+    return parseToNode(self(Self), Logical, tl::isTrue(InAsyncDef)).release();
   });
 }
 
@@ -479,7 +471,7 @@ PyObject *parser_ParseTokenListToNode(PyObject *Self, PyObject *Args, PyObject *
                                      &TokList, &InAsyncDef))
       throw tl::PyErrSet();
     tl::expectType(PyList_Check(TokList), "list", TokList);
-    return parseTokenListToNode(self(Self), TokList, truth(InAsyncDef)).release();
+    return parseTokenListToNode(self(Self), TokList, tl::isTrue(InAsyncDef)).release();
   });
 }
 
@@ -650,7 +642,7 @@ int initParserType(PyObject *Module) {
     D.Flags = Py_TPFLAGS_DEFAULT;
     D.Methods = ParserMethods;
     D.GetSets = ParserGetSets;
-    D.Dealloc = parser_dealloc;
+    D.Dealloc = tl::gcDealloc<parser_clear>;
     D.Traverse = parser_traverse;
     D.Clear = parser_clear;
     D.Init = parser_init;
