@@ -70,6 +70,21 @@ def CorpusFiles(version, limit=None, seed=1234):
     return files
 
 
+def InAsyncDef(logical):
+    """Whether some enclosing scope of the logical is an async def.
+
+    As in CPython 3.6's tokenizer, async and await are keywords anywhere in
+    the body of an async def, nested scopes included.
+    """
+    scope = logical.fParentScope
+    while scope is not None:
+        tokens = [t for t, _ in scope.fTokens if not t.startswith((b'#', b'\\'))]
+        if tokens[:2] == [b'async', b'def']:
+            return True
+        scope = scope.fParentScope
+    return False
+
+
 def ReadBytes(path):
     with open(path, 'rb') as f:
         return f.read()

@@ -84,16 +84,6 @@ def Nodes(node):
             stack.extend(reversed(n.fChildren))
 
 
-def InAsyncDef(logical):
-    scope = logical.fParentScope
-    while scope is not None:
-        tokens = [t for t, _ in scope.fTokens if not t.startswith((b'#', b'\\'))]
-        if tokens[:2] == [b'async', b'def']:
-            return True
-        scope = scope.fParentScope
-    return False
-
-
 class Sweep(object):
     """Calls every accessor of every node; collects the unexpected failures."""
 
@@ -211,7 +201,7 @@ class Sweep(object):
                     continue
                 self.counts['logicals'] += 1
                 try:
-                    tree = parser.ParseToNode(logical, self.version != '2.7' and InAsyncDef(logical))
+                    tree = parser.ParseToNode(logical, self.version != '2.7' and support.InAsyncDef(logical))
                 except (SyntaxError, optpgen.ParseError):
                     self.counts['unparsed'] += 1
                     continue

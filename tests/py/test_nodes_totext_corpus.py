@@ -41,16 +41,6 @@ kKeywords = {
 }
 
 
-def InAsyncDef(logical):
-    scope = logical.fParentScope
-    while scope is not None:
-        tokens = [t for t, _ in scope.fTokens if not t.startswith((b'#', b'\\'))]
-        if tokens[:2] == [b'async', b'def']:
-            return True
-        scope = scope.fParentScope
-    return False
-
-
 def Trees(version, files):
     """(where, tree, discard) for every logical line of files that parses."""
     triple = tuple(int(p) for p in version.split('.')) + (0,)
@@ -60,7 +50,7 @@ def Trees(version, files):
             if logical.fKind in kSkippedKinds:
                 continue
             try:
-                tree = parser.ParseToNode(logical, version != '2.7' and InAsyncDef(logical))
+                tree = parser.ParseToNode(logical, version != '2.7' and support.InAsyncDef(logical))
             except (SyntaxError, optpgen.ParseError):
                 continue
             if tree is not None:

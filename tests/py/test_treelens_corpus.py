@@ -31,24 +31,13 @@ def setUpModule():
         raise unittest.SkipTest('pysource.treelens not importable: %s' % _kImportError)
 
 
-def InAsyncDef(logical):
-    """Whether some enclosing scope of the logical is an async def."""
-    scope = logical.fParentScope
-    while scope is not None:
-        tokens = [t for t, _ in scope.fTokens if not t.startswith((b'#', b'\\'))]
-        if tokens[:2] == [b'async', b'def']:
-            return True
-        scope = scope.fParentScope
-    return False
-
-
 def Analyze(analyzer, text, async_scopes, counts):
     """(logical, result) of every logical line of text whose result is not None."""
     failed = []
     logicals = GetLogicalsFromText(text)
     counts.append(len(logicals))
     for logical in logicals:
-        in_async = async_scopes and InAsyncDef(logical)
+        in_async = async_scopes and support.InAsyncDef(logical)
         result = analyzer.AnalyzeSingleLogical(logical, in_async)
         if result is not None:
             failed.append((logical, result))
