@@ -1,6 +1,6 @@
 """The symbol walker: what lines record under each grammar, the walk limits, and CDispatchWalker."""
 
-import pickle
+import gc
 import StringIO
 import sys
 import unittest
@@ -325,3 +325,32 @@ class DispatchWalkerTest(unittest.TestCase):
 
 if __name__ == '__main__':
     unittest.main()
+
+
+class LeakTest(unittest.TestCase):
+
+    def testNothingKeptAcrossWalks(self):
+        sources = {'2.7': [b'print >>f, `x`\n', b'def f(a, (b, c)=d, *e): pass\n', b'except E, (a, b): pass\n',
+                           b'x = lambda (a, b)=1: a\n'],
+                   '3.6': [b'a, *b = c.d(e, f=1)[g] = [h for h in i if h]\n', b'import a.b as c, d\n',
+                           b'from . import x as y\n', b'def f(a: int = 1, *b, c, **d) -> e: pass\n',
+                           b'class C(B, metaclass=M): pass\n', b'isinstance(x, (A, B))\n', b'x = -1.5, u"s"\n',
+                           b'with a as (b, c): pass\n', b'except (A, B) as e: pass\n', b'f(x for x in y, 1)\n',
+                           b'return {1: 2}\n', b'x: int = yield from g()\n', b'global a\n', b'@d.e(f)\n',
+                           b'x = ' + b'(' * 45 + b'y' + b')' * 45 + b'\n', b'for a, b in c: pass\n']}
+        watched = [si.kGetPrefix, si.kWithinExprPrefix, tl.kListInstanceName, tl.kTupleInstanceName,
+                   support.Analyzer('3.6'), support.Analyzer('2.7')]
+
+        def Run(count):
+            with CapturedStdout():
+                for _ in range(count):
+                    for version, lines in sorted(sources.items()):
+                        for source in lines:
+                            support.AnalyzeLine(version, source)
+        Run(3)
+        gc.collect()
+        objects, refs = len(gc.get_objects()), [sys.getrefcount(o) for o in watched]
+        Run(100)
+        gc.collect()
+        self.assertLessEqual(len(gc.get_objects()) - objects, 2)
+        self.assertEqual([sys.getrefcount(o) for o in watched], refs)
