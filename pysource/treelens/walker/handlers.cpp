@@ -172,11 +172,9 @@ bool isSequenceTarget(PyObject *O) { return isNodeOf(O, C::CTestListStarExpr) ||
 /// The host's literal info, built here: kTypedLiteralPrefix, the kind and ":", then " " and the
 /// literal's text unless it has none.
 Ref buildLiteralInfo(PyObject *Kind, PyObject *Text) {
-  Ref Colon = bytes(":");
   if (Text == Py_None)
-    return concat({sym(Sym::kTypedLiteralPrefix), Kind, Colon.get()});
-  Ref ColonBlank = bytes(": ");
-  return concat({sym(Sym::kTypedLiteralPrefix), Kind, ColonBlank.get(), Text});
+    return concat({sym(Sym::kTypedLiteralPrefix), Kind, K.Colon});
+  return concat({sym(Sym::kTypedLiteralPrefix), Kind, K.ColonBlank, Text});
 }
 
 } // namespace
@@ -199,6 +197,15 @@ void initWalkerConstants() {
   K.KindInt = tl::internName("int");
   K.KindFloat = tl::internName("float");
   K.Isinstance = tl::internName("isinstance");
+  K.Colon = tl::internName(":");
+  K.ColonBlank = tl::internName(": ");
+  K.Semicolon = tl::internName(";");
+  K.Blank = tl::internName(" ");
+  K.Star = tl::internName("*");
+  K.BlankStar = tl::internName(" *");
+  K.Return = tl::internName("return");
+  K.Yield = tl::internName("yield");
+  K.FromBlank = tl::internName("from ");
   K.MimicName = tl::internName("kMimicAstInspectBugs");
   K.AppendTypeEquiv = tl::internName("AppendTypeEquiv");
   K.AppendArgName = tl::internName("AppendArgName");
@@ -257,8 +264,7 @@ void visitName(NW *W, PyObject *Node, PyObject *Atom, PyObject *AllTrailers, Py_
     PyObject *Stored = dictField(W->StoredNames, "_fStoredNames");
     Ref Old = Ref::borrow(PyDict_GetItem(Stored, Name.get()));
     if (Old) {
-      Ref Sep = bytes(";");
-      Info = concat({Old.get(), Sep.get(), Info.get()});
+      Info = concat({Old.get(), K.Semicolon, Info.get()});
     }
     tl::requireStatus(PyDict_SetItem(Stored, Name.get(), Info.get()));
   }
@@ -446,7 +452,10 @@ void processNamesFound(NW *W, PyObject *Node) {
       tl::raise(PyExc_AssertionError, "None name in _fLoadedNames");
     recordTypeEquiv(W, Name, sym(Sym::kGetPrefix));
   }
-  Ref Stored = tl::require(PyDict_Items(dictField(W->StoredNames, "_fStoredNames")));
+  PyObject *StoredDict = dictField(W->StoredNames, "_fStoredNames");
+  if (PyDict_Size(StoredDict) == 0)
+    return;
+  Ref Stored = tl::require(PyDict_Items(StoredDict));
   for (Py_ssize_t J = 0; J < PyList_GET_SIZE(Stored.get()); ++J) {
     PyObject *Item = PyList_GET_ITEM(Stored.get(), J);
     Name = PyTuple_GET_ITEM(Item, 0);
@@ -522,19 +531,17 @@ void visitFromImport(NW *W, PyObject *Node) {
   if (!isNone(From))
     tl::expectType(PyString_Check(From.get()), "bytes", From.get());
   if (fromImportGetImportStar(N)) {
-    Ref Star = bytes("*"), Tail = bytes(" *");
-    appendLogicalTypeEquiv(W, Star.get(), concat({sym(Sym::kFromImportPrefix), From.get(), Tail.get()}).get());
+    appendLogicalTypeEquiv(W, K.Star, concat({sym(Sym::kFromImportPrefix), From.get(), K.BlankStar}).get());
     return;
   }
   Ref Items = fromImportGetAsNameList(N);
   asList(Items.get());
-  Ref Blank = bytes(" ");
   for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Items.get()); ++I) {
     Ref Item = Ref::borrow(PyList_GET_ITEM(Items.get(), I));
     AsNameObject *A = asAsName(Item.get());
     Ref Name = boundName(A);
     Ref Module = field(A->ModuleName);
-    Ref Info = concat({sym(Sym::kFromImportPrefix), From.get(), Blank.get(), Module.get()});
+    Ref Info = concat({sym(Sym::kFromImportPrefix), From.get(), K.Blank, Module.get()});
     recordImported(W, Name.get(), Info.get());
     if (A->AsName)
       appendLogicalTypeEquiv(W, Name.get(), concat({sym(Sym::kImportAsNamePrefix), Name.get()}).get());
@@ -641,7 +648,7 @@ void visitReturn(NW *W, PyObject *Node) {
   Ref Info = typeEquivForNode(W, Value.get(), nullptr);
   if (isNone(Info) || isTextOf(Info.get(), K.TupleInstance))
     return;
-  recordTypeEquiv(W, bytes("return").get(), Info.get());
+  recordTypeEquiv(W, K.Return, Info.get());
 }
 
 void visitYield(NW *W, PyObject *Node) {
@@ -654,8 +661,8 @@ void visitYield(NW *W, PyObject *Node) {
   if (isNone(Info))
     Info = Ref::borrow(K.Empty);
   if (yieldExprIsYieldFrom(N))
-    Info = concat({bytes("from ").get(), Info.get()});
-  recordTypeEquiv(W, bytes("yield").get(), Info.get());
+    Info = concat({K.FromBlank, Info.get()});
+  recordTypeEquiv(W, K.Yield, Info.get());
 }
 
 void visitSingleDecorator(NW *W, PyObject *Node) {
@@ -930,8 +937,7 @@ Ref typeEquivForNode(NW *W, PyObject *Node, PyObject *Extra) {
       return Ref::borrow(Kind);
     Ref Encoded = host::callOne(Host.EncodeStringLiteral, Text ? Text : Py_None);
     tl::expectType(PyString_Check(Encoded.get()), "bytes", Encoded.get());
-    Ref Blank = bytes(" ");
-    return concat({Kind, Blank.get(), Encoded.get()});
+    return concat({Kind, K.Blank, Encoded.get()});
   }
   if (isNodeOf(Node, C::CPower)) {
     if (!isNone(powerGetExponentNode(N)))
