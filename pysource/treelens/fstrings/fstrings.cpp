@@ -402,9 +402,43 @@ Ref tokenBytes(PyObject *Tok) {
   return Ref::borrow(Tok);
 }
 
+/// One record for an expression that spans lines, or null when the text is
+/// not one bracketed expression. Line ends inside a replacement field do not
+/// end the expression, as inside brackets: the text is split in parentheses,
+/// which are then dropped from the record.
+Ref joinedLogical(const std::string &Part) {
+  std::string Wrapped = "(" + Part + "\n)";
+  Ref Logicals = tl::require(Host.Fast->SplitLogicals(Wrapped.data(), static_cast<Py_ssize_t>(Wrapped.size())));
+  if (!PyList_Check(Logicals.get()) || PyList_GET_SIZE(Logicals.get()) != 1)
+    return Ref();
+  PyObject *Only = PyList_GET_ITEM(Logicals.get(), 0);
+  if (!host::isLogical(Only))
+    return Ref();
+  auto *L = reinterpret_cast<host::LogicalLineObject *>(Only);
+  Py_ssize_t N = L->TokenCount;
+  auto IsText = [&](Py_ssize_t I, char C) {
+    PyObject *T = L->Texts[I];
+    return T && PyString_Check(T) && PyString_GET_SIZE(T) == 1 && PyString_AS_STRING(T)[0] == C;
+  };
+  if (N < 2 || !IsText(0, '(') || !IsText(N - 1, ')') || L->Positions[0].Col != 0)
+    return Ref();
+  Ref Tokens = tl::require(PyTuple_New(N - 2));
+  for (Py_ssize_t I = 1; I < N - 1; ++I) {
+    long Row = L->Positions[I].Row, Col = L->Positions[I].Col - (Row == 0 ? 1 : 0);
+    PyObject *Entry = Py_BuildValue("(O(ll))", L->Texts[I], Row, Col);
+    if (!Entry)
+      throw tl::PyErrSet();
+    PyTuple_SET_ITEM(Tokens.get(), I - 1, Entry);
+  }
+  Ref LineText = bytesOf(Part.data(), static_cast<Py_ssize_t>(Part.size()));
+  return tl::require(PyObject_CallFunction(reinterpret_cast<PyObject *>(Host.LogicalLineType),
+                                           const_cast<char *>("(OilO)"), Tokens.get(), 0, 0L, LineText.get()));
+}
+
 /// GetPartList's own work: each expression part is split into logical-line
-/// records, and the expressions of f-strings nested in them follow each
-/// record, placed relative to the token.
+/// records (one, when it is one expression over several lines), and the
+/// expressions of f-strings nested in them follow each record, placed
+/// relative to the token.
 void partListImpl(PyObject *Self, PyObject *Tok, bool ExpOnly, bool WantText, std::vector<ExprItem> &Out) {
   RecursionGuard Guard(" while listing the parts of an f-string");
   Ref Bytes = tokenBytes(Tok);
@@ -418,6 +452,12 @@ void partListImpl(PyObject *Self, PyObject *Tok, bool ExpOnly, bool WantText, st
     }
     Ref Logicals = tl::require(Host.Fast->SplitLogicals(P.Text.data(), static_cast<Py_ssize_t>(P.Text.size())));
     tl::expectType(PyList_Check(Logicals.get()), "list", Logicals.get());
+    if (PyList_GET_SIZE(Logicals.get()) > 1) {
+      if (Ref Joined = joinedLogical(P.Text)) {
+        Logicals = tl::require(PyList_New(1));
+        PyList_SET_ITEM(Logicals.get(), 0, Joined.release());
+      }
+    }
     // Where each record starts in the part: the records' line texts tile it.
     Py_ssize_t Base = P.Text.compare(0, 3, "\xef\xbb\xbf") == 0 ? 3 : 0;
     for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Logicals.get()); ++I) {

@@ -6,6 +6,8 @@
 #include "pysource/treelens/front/front.h"
 #include "pysource/treelens/host/host.h"
 
+#include <cstring>
+
 namespace treelens {
 namespace fstrings {
 
@@ -67,19 +69,10 @@ void errorPosition(LogicalLineObject *L, Py_ssize_t TokI, long &Line, long &Colu
   Column = L->Positions[Count - 1].Col + 1 + (Last && PyString_Check(Last) ? PyString_GET_SIZE(Last) : 0);
 }
 
-/// With the sub-logical's ParseError pending: clears Logical's derived info
-/// and raises "invalid syntax" located, 1-based, where the parser stopped in
-/// the outer line's source.
+/// Clears Logical's derived info and raises "invalid syntax" located, 1-based,
+/// at token SubTokI of the sub-logical Sub, in the outer line's source.
 [[noreturn]] void raiseLocated(PyObject *Logical, Py_ssize_t TokenI, PyObject *Text, Py_ssize_t PartPos,
-                               PyObject *Sub) {
-  PyObject *Type, *Value, *Tb;
-  PyErr_Fetch(&Type, &Value, &Tb);
-  PyErr_NormalizeException(&Type, &Value, &Tb);
-  Ref HoldType = Ref::steal(Type), HoldValue = Ref::steal(Value), HoldTb = Ref::steal(Tb);
-  Ref Context = tl::require(PyObject_GetAttrString(Value ? Value : Py_None, "context"));
-  Py_ssize_t SubTokI = PyNumber_AsSsize_t(Context.get(), PyExc_OverflowError);
-  if (SubTokI == -1 && PyErr_Occurred())
-    throw tl::PyErrSet();
+                               PyObject *Sub, Py_ssize_t SubTokI) {
   host::clearDerivedInfo(Logical);
 
   // The f-string token's own position.
@@ -120,6 +113,79 @@ void errorPosition(LogicalLineObject *L, Py_ssize_t TokI, long &Line, long &Colu
   throw tl::PyErrSet();
 }
 
+/// The token index of a ParseError pending (cleared).
+Py_ssize_t parseErrorContext() {
+  PyObject *Type, *Value, *Tb;
+  PyErr_Fetch(&Type, &Value, &Tb);
+  PyErr_NormalizeException(&Type, &Value, &Tb);
+  Ref HoldType = Ref::steal(Type), HoldValue = Ref::steal(Value), HoldTb = Ref::steal(Tb);
+  Ref Context = tl::require(PyObject_GetAttrString(Value ? Value : Py_None, "context"));
+  Py_ssize_t TokI = PyNumber_AsSsize_t(Context.get(), PyExc_OverflowError);
+  if (TokI == -1 && PyErr_Occurred())
+    throw tl::PyErrSet();
+  return TokI;
+}
+
+bool textIs(PyObject *T, const char *Word) {
+  Py_ssize_t N = static_cast<Py_ssize_t>(std::strlen(Word));
+  return PyString_GET_SIZE(T) == N && std::memcmp(PyString_AS_STRING(T), Word, N) == 0;
+}
+
+/// A statement keyword: it never starts an expression.
+bool isStatementKeyword(PyObject *T) {
+  static const char *const Words[] = {"pass", "break", "continue", "return", "raise", "global", "nonlocal",
+                                      "del", "import", "from", "assert", "if", "elif", "else", "while",
+                                      "for", "try", "except", "finally", "with", "def", "class", "@"};
+  for (const char *W : Words)
+    if (textIs(T, W))
+      return true;
+  return false;
+}
+
+/// Outside brackets, a token that only a statement holds: an assignment, an
+/// annotation colon or a statement separator.
+bool isStatementOperator(PyObject *T) {
+  static const char *const Ops[] = {"=",  ":",  ";",  "+=",  "-=",  "*=",  "/=",  "%=", "&=",
+                                    "|=", "^=", "<<=", ">>=", "**=", "//=", "@="};
+  for (const char *O : Ops)
+    if (textIs(T, O))
+      return true;
+  return false;
+}
+
+/// Index of the token that makes Sub a statement rather than an expression,
+/// or -1. The grammar parses an expression part as a whole logical line, while
+/// the language takes only an expression there: `f'{x = 1}'`, `f'{del x}'` and
+/// `f'{a; b}'` are errors, and must not record their bindings.
+Py_ssize_t statementToken(LogicalLineObject *Sub) {
+  int Depth = 0;
+  bool First = true;
+  for (Py_ssize_t I = 0; I < Sub->TokenCount; ++I) {
+    PyObject *T = Sub->Texts[I];
+    if (!T || !PyString_Check(T) || PyString_GET_SIZE(T) == 0)
+      continue;
+    char C = PyString_AS_STRING(T)[0];
+    if (C == '#' || C == '\\')
+      continue;
+    if (First) {
+      First = false;
+      if (isStatementKeyword(T))
+        return I;
+      // async def, async for, async with
+      if (textIs(T, "async") && I + 1 < Sub->TokenCount && Sub->Texts[I + 1] && PyString_Check(Sub->Texts[I + 1]) &&
+          (textIs(Sub->Texts[I + 1], "def") || textIs(Sub->Texts[I + 1], "for") || textIs(Sub->Texts[I + 1], "with")))
+        return I;
+    }
+    if (PyString_GET_SIZE(T) == 1 && (C == '(' || C == '[' || C == '{'))
+      ++Depth;
+    else if (PyString_GET_SIZE(T) == 1 && (C == ')' || C == ']' || C == '}'))
+      --Depth;
+    else if (Depth == 0 && isStatementOperator(T))
+      return I;
+  }
+  return -1;
+}
+
 /// _InspectSingleFStringToken: analyzes each expression of the token Text (at
 /// index TokenI of Logical) with f-string inspection suppressed and copies
 /// its findings into Logical.
@@ -128,13 +194,18 @@ void inspectSingleFStringToken(AnalyzerObject *A, PyObject *Logical, Py_ssize_t 
   std::vector<ExprItem> Items = expressionPartList(supportOf(A), Text, /*WantText=*/false);
   for (ExprItem &It : Items) {
     PyObject *Sub = It.Logical ? It.Logical.get() : Py_None;
+    if (host::isLogical(Sub)) {
+      Py_ssize_t At = statementToken(record(Sub));
+      if (At >= 0)
+        raiseLocated(Logical, TokenI, Text, It.Pos, Sub, At);
+    }
     bool Ok = tl::guard<bool>(false, [&] {
       inspectSingleLogical(A, Sub, InAsyncDef, /*InFString=*/true);
       return true;
     });
     if (!Ok) {
       if (PyErr_ExceptionMatches(Host.ParseError))
-        raiseLocated(Logical, TokenI, Text, It.Pos, Sub);
+        raiseLocated(Logical, TokenI, Text, It.Pos, Sub, parseErrorContext());
       throw tl::PyErrSet();
     }
     copyFindings(Logical, Sub);
