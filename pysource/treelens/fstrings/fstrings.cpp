@@ -262,6 +262,17 @@ int bracketBalance(Span S) {
   return D;
 }
 
+/// Text that ends in the "\N" of a named character escape: an N after an odd
+/// number of backslashes.
+bool endsWithNamedEscape(Span S) {
+  if (S.Size < 2 || S.Data[S.Size - 1] != 'N')
+    return false;
+  Py_ssize_t Backslashes = 0;
+  for (Py_ssize_t I = S.Size - 2; I >= 0 && S.Data[I] == '\\'; --I)
+    ++Backslashes;
+  return Backslashes % 2 == 1;
+}
+
 /// The raw parts of the token Tok (N bytes). Each delimiter that changes the
 /// kind belongs to no part; a part starts at the byte after it.
 void cutParts(PyObject *Self, const char *Tok, Py_ssize_t N, bool ExpOnly, std::vector<RawPart> &Out) {
@@ -278,7 +289,8 @@ void cutParts(PyObject *Self, const char *Tok, Py_ssize_t N, bool ExpOnly, std::
   Py_ssize_t Start = Prefix;
   int Depth = 0;
   Span Open = {nullptr, 0}; // the quote of the string open inside an expression
-  bool InFormat = false, Skip = false;
+  bool InFormat = false, Skip = false, InNamedEscape = false;
+  bool Raw = std::memchr(Tok, 'r', Prefix) || std::memchr(Tok, 'R', Prefix);
   for (std::size_t I = 0; I < Items.size(); ++I) {
     Span Frag = Items[I].Text;
     if (Skip) {
@@ -290,7 +302,11 @@ void cutParts(PyObject *Self, const char *Tok, Py_ssize_t N, bool ExpOnly, std::
     bool AtTop = !Open.Data && Depth == 0;
     switch (Kind) {
     case kStringPart:
-      if (Frag.is('{')) {
+      if (InNamedEscape) {
+        InNamedEscape = !Frag.is('}');
+      } else if (Frag.is('{') && !Raw && I > 0 && endsWithNamedEscape(Items[I - 1].Text)) {
+        InNamedEscape = true; // "\N{NAME}" names a character: its braces are text
+      } else if (Frag.is('{')) {
         if (I + 1 < Items.size() && Items[I + 1].Text.is('{'))
           Skip = true; // "{{" is an escaped brace, kept doubled in the text
         else
