@@ -390,8 +390,8 @@ int clearDerivedInfo(PyObject *Logical) {
   });
 }
 
-// A bare name goes to fNamesDefined; a (name, info) pair puts the name there
-// and the whole pair in fTypeEquivs, so an imported name carries what it is.
+// A bare name goes to fNamesDefined; of a (name, info) pair only the name goes
+// there: callers record the info with AppendLogicalTypeEquiv, so it is kept once.
 int appendAttrib(PyObject *Logical, PyObject *Attrib) {
   return guard(-1, [&] {
     LogicalLineObject *L = asLogical(Logical);
@@ -406,7 +406,6 @@ int appendAttrib(PyObject *Logical, PyObject *Attrib) {
     PyObject *Info = PyTuple_GET_ITEM(Attrib, 1);
     expectBytes(Info);
     appendTo(&L->NamesDefined, Name);
-    appendTo(&L->TypeEquivs, Attrib);
     return 0;
   });
 }
