@@ -214,15 +214,16 @@ class InspectionTest(unittest.TestCase):
     def testFindingsAreCopied(self):
         class Planted(tl.CFStringSupport):
             def GetExpressionPartList(self, tok_str):
-                sub = First(b'q\n')
-                sub.AppendTypeEquiv(b'q', b'info')
-                sub.AppendNameDefined(b'n')
-                sub.AppendArgName(b'not copied')
-                return [(b'q', 3, sub)] * 2
+                subs = [First(b'q\n'), First(b'q\n')]
+                for sub in subs:
+                    sub.AppendTypeEquiv(b'q', b'info')
+                    sub.AppendNameDefined(b'n')
+                    sub.AppendArgName(b'not copied')
+                return [(b'q', 3, sub) for sub in subs]
 
         logical, result = Analyze(b"x = f'{q}'\n", WithSupport(Planted()))
         self.assertIsNone(result)
-        self.assertEqual([p for p in logical.fTypeEquivs if p[0] == b'q'], [(b'q', b'info')] * 2)
+        self.assertEqual([p for p in logical.fTypeEquivs if p == (b'q', b'info')], [(b'q', b'info')] * 2)
         self.assertEqual([n for n in logical.fNamesDefined if n == b'n'], [b'n'] * 2)
         self.assertEqual(logical.fArgNames, [])
         lost = type('Lost', (tl.CFStringSupport,), {'GetExpressionPartList': lambda self, t: [(b'q', 3, None)]})
