@@ -93,7 +93,7 @@ class FStringCorpusTest(unittest.TestCase):
                     wrong.append((path, logical.fLineText, text, pos))
         verdicts = Judge(items)
         judged = [v for v in verdicts.values() if v is not None]
-        self.assertGreater(len(judged), 300)
+        self.assertGreater(len(judged), len(items) * 3 // 4)
         for key, token, _ in items:
             verdict = verdicts[key]
             if verdict is not None and verdict[0] != verdict[1]:
@@ -138,7 +138,7 @@ class FStringCorpusTest(unittest.TestCase):
             at = sum(len(l) for l in lines[:result.lineno - 1]) + result.offset - 1
             if not 4 <= at < 4 + len(mutant) or logical.fTypeEquivs or logical.fNamesDefined:
                 wrong.append((mutant, 'located at %d' % at, result))
-        self.assertGreater(rejected, 100)
+        self.assertGreater(rejected, len(mutants) // 2)
         self.assertEqual(wrong[:20], [])
 
 
