@@ -101,3 +101,27 @@ def RunOracle(version, script, stdin_data=None):
     if proc.returncode != 0:
         raise AssertionError('oracle %s failed: %s' % (version, err[-2000:]))
     return out
+
+
+_kAnalyzers = {}
+kPy3Keywords = ('False', 'None', 'True', 'and', 'as', 'assert', 'break', 'class', 'continue', 'def', 'del',
+                'elif', 'else', 'except', 'finally', 'for', 'from', 'global', 'if', 'import', 'in', 'is',
+                'lambda', 'nonlocal', 'not', 'or', 'pass', 'raise', 'return', 'try', 'while', 'with', 'yield')
+
+
+def Analyzer(version):
+    """A shared CPGenAnalyzerImpl per language version ('2.7', '3.5', '3.6'), Python 3 keywords for 3.x."""
+    if version not in _kAnalyzers:
+        from pysource import treelens
+        triple = tuple(int(p) for p in version.split('.')) + (0,)
+        py3 = version != '2.7'
+        _kAnalyzers[version] = treelens.CPGenAnalyzerImpl(
+            triple, 'Python-Grammar-%s' % version, list(kPy3Keywords) if py3 else None, py3)
+    return _kAnalyzers[version]
+
+
+def AnalyzeLine(version, source, in_async_def=False):
+    """(result, logical) of the first logical line of source analyzed under version."""
+    from pysource import utils
+    logical = utils.GetLogicalsFromText(source)[0]
+    return Analyzer(version).AnalyzeSingleLogical(logical, in_async_def), logical

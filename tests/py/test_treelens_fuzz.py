@@ -17,7 +17,11 @@ except ImportError as _exc:  # native modules not built
     tl = None
     _kImportError = str(_exc)
 
-kRounds = 600 if support.kSanitized else 3000
+import os
+
+# $TREELENS_FUZZ_ROUNDS and $TREELENS_FUZZ_SEED run it longer or differently.
+kRounds = int(os.environ.get('TREELENS_FUZZ_ROUNDS') or (600 if support.kSanitized else 3000))
+kSeed = int(os.environ.get('TREELENS_FUZZ_SEED') or 20261206)
 kSpecial = [b'\\', b'$', b'?', b'...', b'async', b'await', b'@', b'->', b'else', b'except',
             b'finally', b'elif', b'try', b'def', b'class', b'lambda', b':', b'(', b')', b'[',
             b'{', b'}', b',', b'*', b'**', b'=', b'f"{x}"', b'# type: int', b'\n']
@@ -65,7 +69,7 @@ class FuzzTest(unittest.TestCase):
         logging.getLogger('pysource').removeHandler(self.handler)
 
     def testMangledLines(self):
-        rnd = random.Random(20261206)
+        rnd = random.Random(kSeed)
         analyzers = [tl.CPGenAnalyzerImpl((2, 7, 0), tl.kPy2DefaultGrammar, None, False),
                      tl.CPGenAnalyzerImpl((3, 5, 0), 'Python-Grammar-3.5'),
                      tl.CPGenAnalyzerImpl((3, 6, 0)),

@@ -169,10 +169,14 @@ struct Nesting {
 
 bool isSequenceTarget(PyObject *O) { return isNodeOf(O, C::CTestListStarExpr) || isNodeOf(O, C::CAtom); }
 
+/// The host's literal info, built here: kTypedLiteralPrefix, the kind and ":", then " " and the
+/// literal's text unless it has none.
 Ref buildLiteralInfo(PyObject *Kind, PyObject *Text) {
-  Ref R = tl::require(PyObject_CallFunctionObjArgs(Host.BuildLiteralInfo, Kind, Text, nullptr));
-  tl::expectType(PyString_Check(R.get()), "bytes", R.get());
-  return R;
+  Ref Colon = bytes(":");
+  if (Text == Py_None)
+    return concat({sym(Sym::kTypedLiteralPrefix), Kind, Colon.get()});
+  Ref ColonBlank = bytes(": ");
+  return concat({sym(Sym::kTypedLiteralPrefix), Kind, ColonBlank.get(), Text});
 }
 
 } // namespace
@@ -223,7 +227,12 @@ void processLoadName(NW *W, PyObject *Name) {
   tl::requireStatus(PyDict_SetItem(dictField(W->LoadedNames, "_fLoadedNames"), Name, K.Empty));
 }
 
-void visitNameLiteral(NW *W, PyObject *Node, PyObject *Atom, PyObject *AllTrailers, Py_ssize_t TrailerI) {
+namespace {
+
+/// visitNameLiteral; Rendered, when given, is the text of the atom with its
+/// first TrailerI + 1 trailers, already known to the caller.
+void visitName(NW *W, PyObject *Node, PyObject *Atom, PyObject *AllTrailers, Py_ssize_t TrailerI,
+               const std::string *Rendered) {
   NodeObject *N = asAnyNode(Node);
   Ref Name = field(N->Text);
   if (!PyString_Check(Name.get()) || isLiteralNameText(Name.get()))
@@ -231,7 +240,9 @@ void visitNameLiteral(NW *W, PyObject *Node, PyObject *Atom, PyObject *AllTraile
   bool Load = false;
   if (AllTrailers != Py_None) {
     asList(AllTrailers);
-    if (TrailerI >= 0) {
+    if (TrailerI >= 0 && Rendered) {
+      Name = bytes(*Rendered);
+    } else if (TrailerI >= 0) {
       Ref Leading = tl::require(PyList_GetSlice(AllTrailers, 0, TrailerI + 1));
       Name = textForAtomPlusTrailers(W->ToText, Atom, Leading.get());
       if (isNone(Name))
@@ -251,6 +262,12 @@ void visitNameLiteral(NW *W, PyObject *Node, PyObject *Atom, PyObject *AllTraile
     }
     tl::requireStatus(PyDict_SetItem(Stored, Name.get(), Info.get()));
   }
+}
+
+} // namespace
+
+void visitNameLiteral(NW *W, PyObject *Node, PyObject *Atom, PyObject *AllTrailers, Py_ssize_t TrailerI) {
+  visitName(W, Node, Atom, AllTrailers, TrailerI, nullptr);
 }
 
 void visitDottedName(NW *W, PyObject *Node) {
@@ -360,7 +377,10 @@ void visitWithItem(NW *W, PyObject *Node) {
     visitStoreContextNode(W, Target.get(), false);
 }
 
-void processTargets(NW *W, PyObject *Lhs, PyObject *Rhs) {
+void processTargets(NW *W, PyObject *LhsIn, PyObject *Rhs) {
+  // `(a) = 1` binds a: a parenthesized target is the target inside.
+  Ref Dropped = isNodeOf(LhsIn, C::CAtom) ? dropSimpleParens(LhsIn) : Ref::borrow(LhsIn);
+  PyObject *Lhs = Dropped.get();
   if (!isSequenceTarget(Lhs)) {
     appendEquivNode(W, Lhs, Rhs);
     return;
@@ -727,18 +747,35 @@ void visitAtomPlusTrailers(NW *W, PyObject *Atom, PyObject *AllTrailers) {
   Ref Trailers = Ref::borrow(asList(AllTrailers));
   if (isNodeOf(Atom, C::CNameLiteral))
     visitNameLiteral(W, Atom, Atom, Trailers.get(), -1);
+  else if (PyList_GET_SIZE(Trailers.get()) > 0)
+    visitLoadContextNode(W, Atom); // `(a or b)[k] = v` reads a and b, as a name before trailers is read
   else
     visitNode(W, Atom);
+  // While the atom is a plain name and every trailer so far a plain ".name"
+  // (native classes, the walker's own converter), the dotted text is built
+  // here as the converter would render it, one trailer at a time.
+  PyTypeObject *NameType = &nodeType(C::CNameLiteral);
+  bool Plain = Py_TYPE(Atom) == NameType && Py_TYPE(W->ToText) == &nodeToTextConverterType() &&
+               node(Atom)->Text && PyString_Check(node(Atom)->Text);
+  std::string Dotted = Plain ? std::string(PyString_AS_STRING(node(Atom)->Text), PyString_GET_SIZE(node(Atom)->Text))
+                             : std::string();
   for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Trailers.get()); ++I) {
     Ref Trailer = Ref::borrow(PyList_GET_ITEM(Trailers.get(), I));
     NodeObject *T = asNodeOf(Trailer.get(), C::CTrailer);
     Ref Tok = trailerGetInitialToken(T);
     Ref Inner = ref(childAt(T, 1));
+    Plain = Plain && Py_TYPE(Trailer.get()) == &nodeType(C::CTrailer) && rawCount(T) == 2 &&
+            textIs(Tok.get(), ".") && Py_TYPE(Inner.get()) == NameType && node(Inner.get())->Text &&
+            PyString_Check(node(Inner.get())->Text);
+    if (Plain) {
+      Dotted += '.';
+      Dotted.append(PyString_AS_STRING(node(Inner.get())->Text), PyString_GET_SIZE(node(Inner.get())->Text));
+    }
     if (textIs(Tok.get(), "(") && rawCount(T) == 3) {
       Ref Previous = tl::require(PyList_GetSlice(Trailers.get(), 0, I));
       visitCall(W, Atom, Previous.get(), Inner.get());
     } else if (textIs(Tok.get(), ".") && isNodeOf(Inner.get(), C::CNameLiteral)) {
-      visitNameLiteral(W, Inner.get(), Atom, Trailers.get(), I);
+      visitName(W, Inner.get(), Atom, Trailers.get(), I, Plain ? &Dotted : nullptr);
     } else if (textIs(Tok.get(), "[") || textIs(Tok.get(), "{")) {
       visitLoadContextNode(W, Inner.get());
     } else {
@@ -764,9 +801,10 @@ void processFunctionCall(NW *W, PyObject *FuncName, PyObject *ArgList) {
       PyErr_SetObject(reinterpret_cast<PyObject *>(Py_TYPE(Error.get())), Error.get());
       throw tl::PyErrSet();
     }
+    // Arguments are read even inside an assignment target (`f(x).y = 1` reads x).
     // A bare `*` or `**` without a value (only in broken trees) reads nothing.
     if (!isNone(Value))
-      visitNode(W, Value.get());
+      visitLoadContextNode(W, Value.get());
   }
   if (FuncName != Py_None && isTextOf(FuncName, K.Isinstance))
     processIsInstanceCall(W, Args.get());
@@ -890,7 +928,7 @@ Ref typeEquivForNode(NW *W, PyObject *Node, PyObject *Extra) {
     PyObject *Kind = stringIsUnicode(N) ? K.UnicodeInstance : K.StringInstance;
     if (!W->IncludeExprText)
       return Ref::borrow(Kind);
-    Ref Encoded = tl::require(PyObject_CallFunctionObjArgs(Host.EncodeStringLiteral, Text ? Text : Py_None, nullptr));
+    Ref Encoded = host::callOne(Host.EncodeStringLiteral, Text ? Text : Py_None);
     tl::expectType(PyString_Check(Encoded.get()), "bytes", Encoded.get());
     Ref Blank = bytes(" ");
     return concat({Kind, Blank.get(), Encoded.get()});
