@@ -71,18 +71,9 @@ def CorpusFiles(version, limit=None, seed=1234):
 
 
 def InAsyncDef(logical):
-    """Whether some enclosing scope of the logical is an async def.
-
-    As in CPython 3.6's tokenizer, async and await are keywords anywhere in
-    the body of an async def, nested scopes included.
-    """
-    scope = logical.fParentScope
-    while scope is not None:
-        tokens = [t for t, _ in scope.fTokens if not t.startswith((b'#', b'\\'))]
-        if tokens[:2] == [b'async', b'def']:
-            return True
-        scope = scope.fParentScope
-    return False
+    """The host's rule (pysource.utils.InAsyncDef): inside an async def body, at any depth."""
+    from pysource.utils import InAsyncDef as rule
+    return rule(logical)
 
 
 def ReadBytes(path):

@@ -17,7 +17,7 @@ from tests.py import support
 
 try:
     from pysource import treelens as tl
-    from pysource import cli
+    from pysource import analysis
     from pysource.utils import GetLogicalsFromText
     sys.path.insert(0, os.path.join(support.kRoot, 'bench'))
     from treelens_bench import CompletedSource
@@ -81,15 +81,15 @@ def Compiles27(source):
 class Corpus27Test(unittest.TestCase):
 
     def testStdlib(self):
-        analyzers = cli.Analyzers('2.7')
+        analyzer = analysis.GetAnalyzer('2.7')
         files = support.CorpusFiles('2.7')
         wrong, print_function_files, rejected_files, counts = [], 0, 0, []
         for path in files:
             text = support.ReadBytes(path)
             logicals = GetLogicalsFromText(text)
-            if cli.UsesPrintFunction(logicals):
+            if analysis.UsesPrintFunction(logicals):
                 print_function_files += 1
-            failed = Analyze(analyzers.ForModule(logicals), text, False, counts)
+            failed = Analyze(analyzer.ImplFor(logicals), text, False, counts)
             if Compiles27(text):
                 wrong.extend(Describe(path, l, r) for l, r in failed)
                 continue
