@@ -302,6 +302,23 @@ def ErrorLocation(logical, error):
     return logical.fFirstLine + row, error.offset or 1, error.msg
 
 
+kNoDerivedInfo = ((), (), (), (), ())
+
+
+def KindName(kind):
+    """The name of a record's kind code ('stmt', 'def', ...; 'kindN' for others)."""
+    return kKindNames.get(kind) or 'kind%d' % kind
+
+
+def SplitReads(type_equivs):
+    """(names read, other pairs) of a record's (name, info) type equivalences."""
+    get = symbolinfo.kGetPrefix
+    reads = [name for name, info in type_equivs if info == get]
+    if not reads:
+        return reads, list(type_equivs)
+    return reads, [pair for pair in type_equivs if pair[1] != get]
+
+
 def LineView(logical, error=None):
     """Plain data of one analyzed record (error: what the analyzer returned for it).
 
@@ -312,23 +329,19 @@ def LineView(logical, error=None):
     info) pairs of the arguments), bases (base-class texts), error (None, or
     a dict of message, line and column, 1-based). Texts are bytes.
     """
-    reads, equivs = [], []
-    get = symbolinfo.kGetPrefix
-    for pair in logical.fTypeEquivs:
-        if pair[1] == get:
-            reads.append(pair[0])
-        else:
-            equivs.append(pair)
+    info = logical.GetDerivedInfo() or kNoDerivedInfo
+    names, type_equivs, args, arg_equivs, bases = info
+    reads, equivs = SplitReads(type_equivs)
     view = {
         'line': logical.fFirstLine + 1,
-        'kind': kKindNames.get(logical.fKind) or 'kind%d' % logical.fKind,
+        'kind': KindName(logical.fKind),
         'text': logical.fLineText,
-        'defines': list(logical.fNamesDefined),
+        'defines': list(names),
         'reads': reads,
         'equivs': equivs,
-        'args': list(logical.fArgNames),
-        'arg_equivs': list(logical.fArgTypeEquivs),
-        'bases': list(logical.fBaseClassNames),
+        'args': list(args),
+        'arg_equivs': list(arg_equivs),
+        'bases': list(bases),
         'error': None,
     }
     if error is not None:

@@ -42,7 +42,6 @@ kExitForStatus = {analysis.kOk: kExitOk, analysis.kSkipped: kExitOk,
 
 # ---- JSON: bytes as strings, losslessly
 
-_kHighBit = re.compile(br'[\x80-\xff]')
 # One or more characters of strictly valid UTF-8 (no surrogates, no overlongs).
 _kValidUtf8 = re.compile(br'(?:[\x00-\x7f]|[\xc2-\xdf][\x80-\xbf]|\xe0[\xa0-\xbf][\x80-\xbf]'
                          br'|[\xe1-\xec\xee\xef][\x80-\xbf]{2}|\xed[\x80-\x9f][\x80-\xbf]'
@@ -68,9 +67,14 @@ def DecodeLossless(data):
 
 def JsonString(data):
     """The JSON string (ASCII) for bytes or unicode."""
-    if isinstance(data, bytes) and _kHighBit.search(data):
-        data = DecodeLossless(data)
-    return _EncodeString(data)
+    try:
+        encoded = _EncodeString(data)
+    except UnicodeDecodeError:
+        return _EncodeString(DecodeLossless(data))
+    # The interpreter's UTF-8 decoder lets encoded surrogates through.
+    if '\\ud' in encoded and isinstance(data, bytes):
+        return _EncodeString(DecodeLossless(data))
+    return encoded
 
 
 def _JsonStrings(items):
@@ -81,20 +85,34 @@ def _JsonPairs(pairs):
     return '[' + ', '.join(['[%s, %s]' % (JsonString(n), JsonString(i)) for n, i in pairs]) + ']'
 
 
-def JsonLine(view, prefix=''):
-    """One line's plain-data view as a JSON object; prefix holds leading fields."""
-    error = view['error']
+kJsonNothingRecorded = (', "defines": [], "reads": [], "equivs": [], "args": [], '
+                        '"arg_equivs": [], "bases": [], "error": null}')
+
+
+def JsonLine(logical, error, prefix=''):
+    """One analyzed record as a JSON object (the fields of analysis.LineView);
+    prefix holds leading fields."""
+    head = '{%s"line": %d, "kind": "%s", "text": %s' % (
+        prefix, logical.fFirstLine + 1, analysis.KindName(logical.fKind),
+        JsonString(logical.fLineText))
+    info = logical.GetDerivedInfo()
+    if info is None and error is None:
+        return head + kJsonNothingRecorded
+    names, type_equivs, args, arg_equivs, bases = info or analysis.kNoDerivedInfo
+    reads, equivs = analysis.SplitReads(type_equivs)
     if error is None:
         error_json = 'null'
     else:
-        error_json = '{"message": %s, "line": %d, "column": %d}' % (
-            JsonString(error['message']), error['line'], error['column'])
-    return ('{%s"line": %d, "kind": "%s", "text": %s, "defines": %s, "reads": %s, '
-            '"equivs": %s, "args": %s, "arg_equivs": %s, "bases": %s, "error": %s}' % (
-                prefix, view['line'], view['kind'], JsonString(view['text']),
-                _JsonStrings(view['defines']), _JsonStrings(view['reads']),
-                _JsonPairs(view['equivs']), _JsonStrings(view['args']),
-                _JsonPairs(view['arg_equivs']), _JsonStrings(view['bases']), error_json))
+        error_json = '{"message": %s, "line": %d, "column": %d}' % _ErrorFields(logical, error)
+    return '%s, "defines": %s, "reads": %s, "equivs": %s, "args": %s, "arg_equivs": %s, ' \
+        '"bases": %s, "error": %s}' % (
+            head, _JsonStrings(names), _JsonStrings(reads), _JsonPairs(equivs),
+            _JsonStrings(args), _JsonPairs(arg_equivs), _JsonStrings(bases), error_json)
+
+
+def _ErrorFields(logical, error):
+    line, column, message = analysis.ErrorLocation(logical, error)
+    return JsonString(message), line, column
 
 
 def _Null(value):
@@ -111,19 +129,21 @@ def _Pairs(pairs):
     return b', '.join(n + b' = ' + i for n, i in pairs)
 
 
-def TextBlock(path, view):
-    """The text block of one line, or b'' when it records nothing."""
-    fields = [(b'defines', b', '.join(view['defines'])), (b'reads', b', '.join(view['reads'])),
-              (b'equivs', _Pairs(view['equivs'])), (b'args', b', '.join(view['args'])),
-              (b'arg equivs', _Pairs(view['arg_equivs'])), (b'bases', b', '.join(view['bases']))]
-    lines = [b'    %s: %s\n' % (label, value) for label, value in fields if value]
-    error = view['error']
-    if error is not None:
-        lines.append(b'    error: %d:%d: %s\n' % (error['line'], error['column'], error['message']))
-    if not lines:
+def TextBlock(path, logical, error):
+    """The text block of one analyzed record, or b'' when it records nothing."""
+    info = logical.GetDerivedInfo()
+    if info is None and error is None:
         return b''
-    return b'%s:%d: %s %s\n' % (path, view['line'], view['kind'], _FirstLine(view['text'])) + \
-        b''.join(lines)
+    names, type_equivs, args, arg_equivs, bases = info or analysis.kNoDerivedInfo
+    reads, equivs = analysis.SplitReads(type_equivs)
+    fields = [(b'defines', b', '.join(names)), (b'reads', b', '.join(reads)),
+              (b'equivs', _Pairs(equivs)), (b'args', b', '.join(args)),
+              (b'arg equivs', _Pairs(arg_equivs)), (b'bases', b', '.join(bases))]
+    lines = [b'    %s: %s\n' % (label, value) for label, value in fields if value]
+    if error is not None:
+        lines.append(b'    error: %d:%d: %s\n' % analysis.ErrorLocation(logical, error))
+    return b'%s:%d: %s %s\n' % (path, logical.fFirstLine + 1, analysis.KindName(logical.fKind),
+                                _FirstLine(logical.fLineText)) + b''.join(lines)
 
 
 # ---- one file
@@ -157,15 +177,14 @@ def Report(result, options):
         out = b''.join(b'%s:%d:%d: %s\n' % ((path,) + analysis.ErrorLocation(l, e))
                        for l, e in pairs)
     elif fmt == 'text':
-        out = b''.join(TextBlock(path, analysis.LineView(l, e)) for l, e in pairs)
+        out = b''.join([TextBlock(path, l, e) for l, e in pairs])
     elif fmt == 'jsonl':
         prefix = '"path": %s, "version": %s, ' % (JsonString(path), _Null(result.version))
-        out = b''.join(JsonLine(analysis.LineView(l, e), prefix) + '\n' for l, e in pairs)
+        out = b''.join([JsonLine(l, e, prefix) + '\n' for l, e in pairs])
     else:
         out = '{"path": %s, "version": %s, "status": "%s", "problem": %s, "lines": [%s]}' % (
             JsonString(path), _Null(result.version), result.status, _Null(result.problem),
-            ''.join(('\n  ' if i == 0 else ',\n  ') + JsonLine(analysis.LineView(l, e))
-                    for i, (l, e) in enumerate(pairs)))
+            ','.join(['\n  ' + JsonLine(l, e) for l, e in pairs]))
     return out, problem, len(result.logicals), errors, result.status
 
 
