@@ -490,8 +490,8 @@ int clearDerivedInfo(PyObject *Logical) {
   });
 }
 
-// A bare name goes to fNamesDefined; a (name, info) pair puts the name there
-// and the whole pair in fTypeEquivs, so an imported name carries what it is.
+// A bare name goes to fNamesDefined; of a (name, info) pair only the name goes
+// there: callers record the info with AppendLogicalTypeEquiv, so it is kept once.
 int appendAttrib(PyObject *Logical, PyObject *Attrib) {
   return guard(-1, [&] {
     LogicalLineObject *L = asLogical(Logical);
@@ -506,10 +506,6 @@ int appendAttrib(PyObject *Logical, PyObject *Attrib) {
     PyObject *Info = PyTuple_GET_ITEM(Attrib, 1);
     expectBytes(Info);
     appendBytes(&L->NamesDefined, Name);
-    if (PyTuple_CheckExact(Attrib) && PyString_CheckExact(Name) && PyString_CheckExact(Info))
-      appendTo(&L->TypeEquivs, Attrib);
-    else
-      appendPair(&L->TypeEquivs, Name, Info);
     return 0;
   });
 }
