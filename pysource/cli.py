@@ -142,8 +142,8 @@ def TextBlock(path, logical, error):
     lines = [b'    %s: %s\n' % (label, value) for label, value in fields if value]
     if error is not None:
         lines.append(b'    error: %d:%d: %s\n' % analysis.ErrorLocation(logical, error))
-    return b'%s:%d: %s %s\n' % (path, logical.fFirstLine + 1, analysis.KindName(logical.fKind),
-                                _FirstLine(logical.fLineText)) + b''.join(lines)
+    return b'%s:%d: [%s] %s\n' % (path, logical.fFirstLine + 1, analysis.KindName(logical.fKind),
+                                  _FirstLine(logical.fLineText).strip()) + b''.join(lines)
 
 
 # ---- one file
@@ -217,36 +217,44 @@ def _WorkerReport(task):
 # ---- the run
 
 class Progress(object):
-    """A progress bar on standard error, drawn only when it is a terminal and
-    the run has lasted more than a moment."""
+    """A progress bar on a stream (standard error), drawn only when it is a
+    terminal and the run has lasted more than a moment."""
 
     kDelay = 0.5
     kInterval = 0.1
+    kWidth = 30
 
-    def __init__(self, total, enabled):
+    def __init__(self, total, stream, clock=time.time):
         self.total = total
-        self.enabled = enabled and total > 0
-        self.start = self.last = time.time()
+        self.stream = stream
+        self.enabled = total > 0 and stream.isatty()
+        self.clock = clock
+        self.start = self.last = clock()
         self.drawn = False
 
     def Update(self, done):
         if not self.enabled:
             return
-        now = time.time()
+        now = self.clock()
         if now - self.start < self.kDelay or now - self.last < self.kInterval:
             return
         self.last = now
-        width = 30
-        filled = width * done // self.total
-        sys.stderr.write('\r[%s%s] %d/%d files' % ('#' * filled, '.' * (width - filled), done,
-                                                   self.total))
-        sys.stderr.flush()
+        filled = self.kWidth * done // self.total
+        self.stream.write('\r[%s%s] %d/%d files' % ('#' * filled, '.' * (self.kWidth - filled),
+                                                    done, self.total))
+        self.stream.flush()
         self.drawn = True
 
     def Close(self):
         if self.drawn:
-            sys.stderr.write('\r' + ' ' * 60 + '\r')
-            sys.stderr.flush()
+            self.stream.write('\r' + ' ' * (self.kWidth + 30) + '\r')
+            self.stream.flush()
+            self.drawn = False
+
+
+class _Silent(object):
+    def isatty(self):
+        return False
 
 
 def _Tasks(args, stdin):
@@ -301,10 +309,20 @@ def Main(argv=None, stdin=None, stdout=None, stderr=None):
     stdin = stdin or getattr(sys.stdin, 'buffer', sys.stdin)
     out = stdout or getattr(sys.stdout, 'buffer', sys.stdout)
     err = stderr or sys.stderr
+    # The analyzer writes its diagnostics (a walk that hit its limits) to
+    # sys.stdout; they go to standard error, the output stays parseable.
+    saved_stdout, sys.stdout = sys.stdout, err
+    try:
+        return _Run(args, stdin, out, err)
+    finally:
+        sys.stdout = saved_stdout
+
+
+def _Run(args, stdin, out, err):
     started = time.time()
     options = Options(args.lang, args.format, args.errors_only)
     tasks = _Tasks(args, stdin)
-    progress = Progress(len(tasks), not args.quiet and err.isatty())
+    progress = Progress(len(tasks), _Silent() if args.quiet else err)
     pool = None
     if args.jobs > 1 and len(tasks) > 1:
         import multiprocessing
