@@ -27,6 +27,7 @@ Exit status: 0 when every file was analyzed and no line has a syntax error,
 from __future__ import print_function
 
 import argparse
+import errno
 import json
 import os
 import re
@@ -257,6 +258,17 @@ class _Silent(object):
         return False
 
 
+def _Abandon(pool, status):
+    """Stops the run at once: the workers, then this process, with status.
+
+    Pool.terminate can wait forever on a result queue no one reads; nothing
+    that remains is worth flushing."""
+    if pool is not None:
+        for worker in pool._pool:
+            worker.terminate()
+    os._exit(status)
+
+
 def _Tasks(args, stdin):
     """The tasks of a run in output order: (path, status, problem, text or None)."""
     tasks = []
@@ -351,17 +363,13 @@ def _Run(args, stdin, out, err):
             out.write('\n]}\n')
         out.flush()
     except KeyboardInterrupt:
-        if pool is not None:
-            pool.terminate()
         progress.Close()
         err.write('interrupted\n')
-        return 130
-    except IOError as e:      # standard output closed (a pager quit)
-        if pool is not None:
-            pool.terminate()
-        if e.errno == 32:
-            return kExitProblem
-        raise
+        _Abandon(pool, 130)
+    except IOError as e:
+        if e.errno != errno.EPIPE:
+            raise
+        _Abandon(pool, kExitProblem)     # standard output was closed (a pager quit)
     if pool is not None:
         pool.close()
         pool.join()
