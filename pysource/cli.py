@@ -1,181 +1,383 @@
-"""Command line: analyse Python files and folders one logical line at a time.
+"""treelens: what each logical line of Python source defines, reads and fails on.
 
-    python2.7 -m pysource.cli [--lang 2.7|3.5|3.6] [--split-only] PATH...
+    treelens [options] PATH...        (or: python2.7 -m pysource.cli ...)
 
-Each PATH is a .py file or a folder searched recursively for .py files. For
-every logical line the output gives its first line number, kind and text, and
-what the analyzer recorded: names defined, type equivalences, argument names,
-base classes, or the syntax error. With --split-only, or when the analyzer
-module is not built, it prints the logical lines with their kinds and tokens.
+Each PATH is a file, a folder (searched recursively for .py and .pyi files,
+in sorted order), or - for standard input.
+
+Formats (--format):
+  text    one block per logical line that records something (default)
+  json    one document: {"files": [{"path", "version", "status", "problem",
+          "lines": [...]}, ...]}
+  jsonl   one object per logical line, with its "path" and "version"
+A line has the fields line, kind, text, defines, reads, equivs, args,
+arg_equivs, bases and error (null, or message, line and column, 1-based).
+Texts are the source bytes decoded as UTF-8; a byte that is not valid UTF-8
+appears as the lone surrogate U+DC80 + byte, so that in Python 3
+text.encode('utf-8', 'surrogateescape') gives back the exact bytes.
+
+--errors-only prints only the syntax errors, as path:line:col: message (the
+column counts bytes from 1); with json or jsonl, only the lines with one.
+
+Exit status: 0 when every file was analyzed and no line has a syntax error,
+1 when some line has one, 2 for a usage error or a path that cannot be read
+(the other paths are still analyzed). Problems go to standard error.
 """
 
 from __future__ import print_function
 
 import argparse
+import errno
+import json
 import os
+import re
 import sys
+import time
 
-from pysource import utils
+from pysource import analysis
 
-kKindNames = {0: 'stmt', 1: 'class', 2: 'def', 11: 'try', 21: 'comment', 22: 'blank'}
+kFormats = ('text', 'json', 'jsonl')
+kExitOk, kExitSyntax, kExitProblem = 0, 1, 2
+kExitForStatus = {analysis.kOk: kExitOk, analysis.kSkipped: kExitOk,
+                  analysis.kSyntaxError: kExitSyntax, analysis.kUnreadable: kExitProblem}
 
-# Keywords of Python 3.5 and 3.6 (async and await are handled by the parser).
-kPy3Keywords = (
-    'False', 'None', 'True', 'and', 'as', 'assert', 'break', 'class', 'continue',
-    'def', 'del', 'elif', 'else', 'except', 'finally', 'for', 'from', 'global',
-    'if', 'import', 'in', 'is', 'lambda', 'nonlocal', 'not', 'or', 'pass',
-    'raise', 'return', 'try', 'while', 'with', 'yield')
+# ---- JSON: bytes as strings, losslessly
 
-# Language version -> (version triple, grammar file, is a Python 3 grammar,
-# keywords; None for the interpreter's own list).
-kPrintFunctionGrammar = 'Python-Grammar-2.7-print-function'
-
-kLanguages = {
-    '2.7': ((2, 7, 0), 'Python-Grammar-2.7', False, None),
-    '3.5': ((3, 5, 0), 'Python-Grammar-3.5', True, kPy3Keywords),
-    '3.6': ((3, 6, 0), 'Python-Grammar-3.6', True, kPy3Keywords),
-}
+# One or more characters of strictly valid UTF-8 (no surrogates, no overlongs).
+_kValidUtf8 = re.compile(br'(?:[\x00-\x7f]|[\xc2-\xdf][\x80-\xbf]|\xe0[\xa0-\xbf][\x80-\xbf]'
+                         br'|[\xe1-\xec\xee\xef][\x80-\xbf]{2}|\xed[\x80-\x9f][\x80-\xbf]'
+                         br'|\xf0[\x90-\xbf][\x80-\xbf]{2}|[\xf1-\xf3][\x80-\xbf]{3}'
+                         br'|\xf4[\x80-\x8f][\x80-\xbf]{2})+')
+_EncodeString = json.encoder.encode_basestring_ascii
 
 
-def IterSourceFiles(paths):
-    """Yields the .py files named by paths, folders searched in sorted order."""
-    for path in paths:
-        if os.path.isdir(path):
-            found = []
-            for dirpath, dirnames, filenames in os.walk(path):
-                found.extend(os.path.join(dirpath, name) for name in filenames
-                             if name.endswith('.py'))
-            for name in sorted(found, key=lambda p: p.split(os.sep)):
-                yield name
+def DecodeLossless(data):
+    """Unicode for bytes: strict UTF-8, each other byte as U+DC80 + byte."""
+    parts = []
+    pos, end = 0, len(data)
+    while pos < end:
+        m = _kValidUtf8.match(data, pos)
+        if m:
+            parts.append(m.group().decode('utf-8'))
+            pos = m.end()
         else:
-            yield path
+            parts.append(unichr(0xDC00 + ord(data[pos])))
+            pos += 1
+    return u''.join(parts)
 
 
-def UsesPrintFunction(logicals):
-    """True when a module imports print_function from __future__.
-
-    Python 2.7 then parses the whole module without the print statement; the
-    analyzer needs the grammar variant that has none.
-    """
-    for logical in logicals:
-        if logical.fKind in (21, 22) or logical.fTokenCount < 4:
-            continue
-        texts = [logical.GetTokenString(i) for i in range(logical.fTokenCount)]
-        if texts[:3] == [b'from', b'__future__', b'import'] and b'print_function' in texts:
-            return True
-    return False
-
-
-def InAsyncDef(logical):
-    """True when the nearest enclosing def of a logical is an async def."""
-    scope = logical.fParentScope
-    while scope is not None:
-        if scope.fKind == 2:
-            return scope.fTokenCount > 0 and scope.GetTokenString(0) == b'async'
-        if scope.fKind == 1:
-            return False
-        scope = scope.fParentScope
-    return False
-
-
-def _Text(logical):
-    return logical.fLineText.rstrip(b'\r\n').split(b'\n')[0].rstrip(b'\r')
-
-
-def _Show(values):
-    out = []
-    for v in values:
-        if isinstance(v, tuple):
-            out.append(b'='.join(x if isinstance(x, bytes) else repr(x) for x in v))
-        else:
-            out.append(v if isinstance(v, bytes) else repr(v))
-    return b', '.join(out)
-
-
-def PrintSplit(logical, out):
-    print('%5d  %-7s %s' % (logical.fFirstLine + 1, kKindNames.get(logical.fKind, logical.fKind),
-                            _Text(logical)), file=out)
-    if logical.fTokenCount:
-        print('       tokens: %s' % ' '.join(repr(t) for t, _ in logical.fTokens), file=out)
-
-
-def PrintAnalysis(logical, error, out):
-    PrintSplit(logical, out)
-    if error is not None:
-        print('       error: %s (line %s, column %s)' % (error.msg, error.lineno, error.offset),
-              file=out)
-        return
-    for label, attr in (('defines', 'fNamesDefined'), ('equivs', 'fTypeEquivs'),
-                        ('args', 'fArgNames'), ('arg equivs', 'fArgTypeEquivs'),
-                        ('bases', 'fBaseClassNames')):
-        values = getattr(logical, attr)
-        if values:
-            print('       %s: %s' % (label, _Show(values)), file=out)
-
-
-def MakeAnalyzer(lang, print_function=False):
-    """The analyzer for a language version, or None when the module is not built.
-
-    With print_function (2.7 only), the analyzer for modules that import it.
-    """
+def JsonString(data):
+    """The JSON string (ASCII) for bytes or unicode."""
     try:
-        from pysource import treelens
-    except ImportError:
-        return None
-    triple, grammar, py3, keywords = kLanguages[lang]
-    if print_function and not py3:
-        import keyword
-        grammar = kPrintFunctionGrammar
-        keywords = [k for k in keyword.kwlist if k != 'print']
-    return treelens.CPGenAnalyzerImpl(triple, grammar, keywords, py3, grammar)
+        encoded = _EncodeString(data)
+    except UnicodeDecodeError:
+        return _EncodeString(DecodeLossless(data))
+    # The interpreter's UTF-8 decoder lets encoded surrogates through.
+    if '\\ud' in encoded and isinstance(data, bytes):
+        return _EncodeString(DecodeLossless(data))
+    return encoded
 
 
-class Analyzers(object):
-    """The analyzers of one language version, made when first needed."""
-
-    def __init__(self, lang):
-        self._lang = lang
-        self._made = {}
-
-    def ForModule(self, logicals):
-        """The analyzer for a module's logicals; None when the module is not built."""
-        key = self._lang == '2.7' and UsesPrintFunction(logicals)
-        if key not in self._made:
-            self._made[key] = MakeAnalyzer(self._lang, key)
-        return self._made[key]
+def _JsonStrings(items):
+    return '[' + ', '.join([JsonString(t) for t in items]) + ']'
 
 
-def Main(argv=None):
-    parser = argparse.ArgumentParser(description=__doc__.split('\n\n')[0])
-    parser.add_argument('paths', nargs='+', metavar='PATH')
-    parser.add_argument('--lang', choices=sorted(kLanguages), default='2.7',
-                        help='language version of the sources (default 2.7)')
-    parser.add_argument('--split-only', action='store_true',
-                        help='only split into logical lines and tokens')
-    args = parser.parse_args(argv)
-    analyzers = None if args.split_only else Analyzers(args.lang)
-    out = sys.stdout
-    status = 0
-    for path in IterSourceFiles(args.paths):
-        try:
-            with open(path, 'rb') as f:
-                text = f.read()
-        except (IOError, OSError) as e:
-            print('%s: cannot read: %s' % (path, e), file=sys.stderr)
-            status = 1
+def _JsonPairs(pairs):
+    return '[' + ', '.join(['[%s, %s]' % (JsonString(n), JsonString(i)) for n, i in pairs]) + ']'
+
+
+kJsonNothingRecorded = (', "defines": [], "reads": [], "equivs": [], "args": [], '
+                        '"arg_equivs": [], "bases": [], "error": null}')
+
+
+def JsonLine(logical, error, prefix=''):
+    """One analyzed record as a JSON object (the fields of analysis.LineView);
+    prefix holds leading fields."""
+    head = '{%s"line": %d, "kind": "%s", "text": %s' % (
+        prefix, logical.fFirstLine + 1, analysis.KindName(logical.fKind),
+        JsonString(logical.fLineText))
+    info = logical.GetDerivedInfo()
+    if info is None and error is None:
+        return head + kJsonNothingRecorded
+    names, type_equivs, args, arg_equivs, bases = info or analysis.kNoDerivedInfo
+    reads, equivs = analysis.SplitReads(type_equivs)
+    if error is None:
+        error_json = 'null'
+    else:
+        error_json = '{"message": %s, "line": %d, "column": %d}' % _ErrorFields(logical, error)
+    return '%s, "defines": %s, "reads": %s, "equivs": %s, "args": %s, "arg_equivs": %s, ' \
+        '"bases": %s, "error": %s}' % (
+            head, _JsonStrings(names), _JsonStrings(reads), _JsonPairs(equivs),
+            _JsonStrings(args), _JsonPairs(arg_equivs), _JsonStrings(bases), error_json)
+
+
+def _ErrorFields(logical, error):
+    line, column, message = analysis.ErrorLocation(logical, error)
+    return JsonString(message), line, column
+
+
+def _Null(value):
+    return 'null' if value is None else JsonString(value)
+
+
+# ---- text
+
+def _FirstLine(text):
+    return text.split(b'\n', 1)[0].rstrip(b'\r\n').split(b'\r', 1)[0]
+
+
+def _Pairs(pairs):
+    return b', '.join(n + b' = ' + i for n, i in pairs)
+
+
+def TextBlock(path, logical, error):
+    """The text block of one analyzed record, or b'' when it records nothing."""
+    info = logical.GetDerivedInfo()
+    if info is None and error is None:
+        return b''
+    names, type_equivs, args, arg_equivs, bases = info or analysis.kNoDerivedInfo
+    reads, equivs = analysis.SplitReads(type_equivs)
+    fields = [(b'defines', b', '.join(names)), (b'reads', b', '.join(reads)),
+              (b'equivs', _Pairs(equivs)), (b'args', b', '.join(args)),
+              (b'arg equivs', _Pairs(arg_equivs)), (b'bases', b', '.join(bases))]
+    lines = [b'    %s: %s\n' % (label, value) for label, value in fields if value]
+    if error is not None:
+        lines.append(b'    error: %d:%d: %s\n' % analysis.ErrorLocation(logical, error))
+    return b'%s:%d: [%s] %s\n' % (path, logical.fFirstLine + 1, analysis.KindName(logical.fKind),
+                                  _FirstLine(logical.fLineText).strip()) + b''.join(lines)
+
+
+# ---- one file
+
+class Options(object):
+    """What the output of a file depends on."""
+
+    def __init__(self, version, fmt, errors_only):
+        self.version = version
+        self.fmt = fmt
+        self.errors_only = errors_only
+
+
+def _PathBytes(path):
+    return path.encode('utf-8') if isinstance(path, unicode) else path
+
+
+def Report(result, options):
+    """(output bytes, problem line or None, logical lines, syntax errors, status) of a FileAnalysis."""
+    path = _PathBytes(result.path)
+    problem = None
+    if result.problem is not None:
+        problem = '%s: %s: %s\n' % (path, 'note' if result.status == analysis.kSkipped
+                                    else 'error', result.problem)
+    pairs = zip(result.logicals, result.errors)
+    if options.errors_only:
+        pairs = [(l, e) for l, e in pairs if e is not None]
+    errors = sum(1 for e in result.errors if e is not None)
+    fmt = options.fmt
+    if options.errors_only and fmt == 'text':
+        out = b''.join(b'%s:%d:%d: %s\n' % ((path,) + analysis.ErrorLocation(l, e))
+                       for l, e in pairs)
+    elif fmt == 'text':
+        out = b''.join([TextBlock(path, l, e) for l, e in pairs])
+    elif fmt == 'jsonl':
+        prefix = '"path": %s, "version": %s, ' % (JsonString(path), _Null(result.version))
+        out = b''.join([JsonLine(l, e, prefix) + '\n' for l, e in pairs])
+    else:
+        out = '{"path": %s, "version": %s, "status": "%s", "problem": %s, "lines": [%s]}' % (
+            JsonString(path), _Null(result.version), result.status, _Null(result.problem),
+            ','.join(['\n  ' + JsonLine(l, e) for l, e in pairs]))
+    return out, problem, len(result.logicals), errors, result.status
+
+
+def ReportTask(task, options):
+    """Analyzes one task of the run and reports it (see Report)."""
+    path, status, problem, text = task
+    if problem is not None:
+        result = analysis.FileAnalysis(path, status=status, problem=problem)
+    elif text is not None:
+        result = analysis.AnalyzeText(text, options.version, path)
+    else:
+        result = analysis.AnalyzeFile(path, options.version)
+    return Report(result, options)
+
+
+_gOptions = None
+
+
+def _WorkerInit(options):
+    global _gOptions
+    _gOptions = options
+    import signal
+    signal.signal(signal.SIGINT, signal.SIG_IGN)
+
+
+def _WorkerReport(task):
+    return ReportTask(task, _gOptions)
+
+
+# ---- the run
+
+class Progress(object):
+    """A progress bar on a stream (standard error), drawn only when it is a
+    terminal and the run has lasted more than a moment."""
+
+    kDelay = 0.5
+    kInterval = 0.1
+    kWidth = 30
+
+    def __init__(self, total, stream, clock=time.time):
+        self.total = total
+        self.stream = stream
+        self.enabled = total > 0 and stream.isatty()
+        self.clock = clock
+        self.start = self.last = clock()
+        self.drawn = False
+
+    def Update(self, done):
+        if not self.enabled:
+            return
+        now = self.clock()
+        if now - self.start < self.kDelay or now - self.last < self.kInterval:
+            return
+        self.last = now
+        filled = self.kWidth * done // self.total
+        self.stream.write('\r[%s%s] %d/%d files' % ('#' * filled, '.' * (self.kWidth - filled),
+                                                    done, self.total))
+        self.stream.flush()
+        self.drawn = True
+
+    def Close(self):
+        if self.drawn:
+            self.stream.write('\r' + ' ' * (self.kWidth + 30) + '\r')
+            self.stream.flush()
+            self.drawn = False
+
+
+class _Silent(object):
+    def isatty(self):
+        return False
+
+
+def _Abandon(pool, status):
+    """Stops the run at once: the workers, then this process, with status.
+
+    Pool.terminate can wait forever on a result queue no one reads; nothing
+    that remains is worth flushing."""
+    if pool is not None:
+        for worker in pool._pool:
+            worker.terminate()
+    os._exit(status)
+
+
+def _Tasks(args, stdin):
+    """The tasks of a run in output order: (path, status, problem, text or None)."""
+    tasks = []
+    for path in args.paths:
+        if path == '-':
+            tasks.append((args.stdin_filename, analysis.kOk, None, stdin.read()))
             continue
-        print('== %s' % path, file=out)
-        logicals = utils.GetLogicalsFromText(text)
-        analyzer = analyzers.ForModule(logicals) if analyzers else None
-        for logical in logicals:
-            if analyzer is None:
-                PrintSplit(logical, out)
-            elif logical.fKind == 22:
-                continue
+        if not os.path.lexists(path):
+            tasks.append((path, analysis.kUnreadable, 'cannot read: No such file or directory',
+                          None))
+            continue
+        for found, status, problem in analysis.IterSourcePaths([path]):
+            tasks.append((found, status, problem, None))
+    return tasks
+
+
+def _ParseArgs(argv):
+    parser = argparse.ArgumentParser(
+        prog='treelens', description=__doc__.split('\n\n')[0],
+        epilog='Exit status: 0 no syntax error, 1 syntax errors, 2 usage error or unreadable path.')
+    parser.add_argument('paths', nargs='+', metavar='PATH',
+                        help='file or folder to analyse, or - for standard input')
+    parser.add_argument('--lang', choices=analysis.kVersions + (analysis.kAuto,),
+                        default=analysis.kAuto,
+                        help='language version of the sources; auto (default) picks per file '
+                        'the newest version with no syntax error')
+    parser.add_argument('--format', choices=kFormats, default='text',
+                        help='output format (default text)')
+    parser.add_argument('--errors-only', action='store_true',
+                        help='report only syntax errors (text: path:line:col: message)')
+    parser.add_argument('--stdin-filename', default='-', metavar='NAME',
+                        help='the path to report for standard input')
+    parser.add_argument('-j', '--jobs', type=int, default=1, metavar='N',
+                        help='analyse files in N processes (output is the same)')
+    parser.add_argument('-q', '--quiet', action='store_true',
+                        help='no progress bar and no closing summary')
+    # Paths may follow options too (treelens a.py --format json b.py).
+    args, extra = parser.parse_known_args(argv)
+    unknown = [a for a in extra if a.startswith('-') and a != '-']
+    if unknown:
+        parser.error('unrecognized arguments: %s' % ' '.join(unknown))
+    args.paths.extend(extra)
+    if args.jobs < 1:
+        parser.error('-j must be at least 1')
+    return args
+
+
+def Main(argv=None, stdin=None, stdout=None, stderr=None):
+    args = _ParseArgs(argv)
+    stdin = stdin or getattr(sys.stdin, 'buffer', sys.stdin)
+    out = stdout or getattr(sys.stdout, 'buffer', sys.stdout)
+    err = stderr or sys.stderr
+    # The analyzer writes its diagnostics (a walk that hit its limits) to
+    # sys.stdout; they go to standard error, the output stays parseable.
+    saved_stdout, sys.stdout = sys.stdout, err
+    try:
+        return _Run(args, stdin, out, err)
+    finally:
+        sys.stdout = saved_stdout
+
+
+def _Run(args, stdin, out, err):
+    started = time.time()
+    options = Options(args.lang, args.format, args.errors_only)
+    tasks = _Tasks(args, stdin)
+    progress = Progress(len(tasks), _Silent() if args.quiet else err)
+    pool = None
+    if args.jobs > 1 and len(tasks) > 1:
+        import multiprocessing
+        pool = multiprocessing.Pool(min(args.jobs, len(tasks)), _WorkerInit, (options,))
+        reports = pool.imap(_WorkerReport, tasks, 1)
+    else:
+        reports = (ReportTask(task, options) for task in tasks)
+    exit_status, lines, errors, files = kExitOk, 0, 0, 0
+    try:
+        if args.format == 'json':
+            out.write('{"files": [')
+        for i, (text, problem, count, error_count, status) in enumerate(reports):
+            if args.format == 'json':
+                out.write(('\n' if i == 0 else ',\n') + text)
             else:
-                PrintAnalysis(logical, analyzer.AnalyzeSingleLogical(logical, InAsyncDef(logical)),
-                              out)
-    return status
+                out.write(text)
+            if problem is not None:
+                progress.Close()
+                err.write(problem)
+            exit_status = max(exit_status, kExitForStatus[status])
+            lines += count
+            errors += error_count
+            files += status in (analysis.kOk, analysis.kSyntaxError)
+            progress.Update(i + 1)
+        if args.format == 'json':
+            out.write('\n]}\n')
+        out.flush()
+    except KeyboardInterrupt:
+        progress.Close()
+        err.write('interrupted\n')
+        _Abandon(pool, 130)
+    except IOError as e:
+        if e.errno != errno.EPIPE:
+            raise
+        _Abandon(pool, kExitProblem)     # standard output was closed (a pager quit)
+    if pool is not None:
+        pool.close()
+        pool.join()
+    progress.Close()
+    if not args.quiet:
+        err.write('%d files, %d logical lines, %d syntax errors, %.2f seconds\n'
+                  % (files, lines, errors, time.time() - started))
+    return exit_status
 
 
 if __name__ == '__main__':

@@ -16,3 +16,34 @@ def GetLogicalsFromText(text):
     elif not isinstance(text, bytes):
         raise TypeError('Expected bytes, got %.200s' % type(text).__name__)
     return _fastaccess._SplitLogicals(text)
+
+
+def InAsyncDef(logical):
+    """Whether a logical lies in the body of an `async def`, at any depth.
+
+    This is CPython 3.6's rule: its tokenizer makes `async` and `await`
+    keywords from an `async def` to the end of that function's body, nested
+    scopes (plain defs, classes) included. The `async def` line itself is not
+    inside; the parser sees its `async` keyword there on its own.
+    """
+    scope = logical.fParentScope
+    while scope is not None:
+        if scope.fKind == 2 and _StartsAsyncDef(scope):
+            return True
+        scope = scope.fParentScope
+    return False
+
+
+def _StartsAsyncDef(logical):
+    """Whether the first two tokens, comments and backslashes aside, are `async def`."""
+    seen = 0
+    for i in range(logical.fTokenCount):
+        text = logical.GetTokenString(i)
+        if text.startswith((b'#', b'\\')):
+            continue
+        if text != (b'async', b'def')[seen]:
+            return False
+        seen += 1
+        if seen == 2:
+            return True
+    return False

@@ -38,14 +38,20 @@ struct LogicalLineObject {
   PyObject *LineText;          ///< bytes, owned
   PyObject *ParentScope;       ///< owned or NULL (unset)
   PyObject *LocalScopeDefined; ///< owned or NULL (unset)
+  // The derived-info lists are private to the record: only the Api
+  // operations and the record's methods append to them, and only exact
+  // bytes and (bytes, bytes) tuples, so the collector need not track them.
+  // Python code sees copies.
   PyObject *NamesDefined;      ///< list or NULL until first append
   PyObject *TypeEquivs;        ///< list of (name, info) or NULL
   PyObject *ArgNames;          ///< list or NULL
   PyObject *ArgTypeEquivs;     ///< list of (name, info) or NULL
   PyObject *BaseClassNames;    ///< list or NULL
   PyObject *TokensView;        ///< cached fTokens tuple or NULL
-  PyObject *Dict;              ///< instance dict for subclasses, or NULL
+  PyObject *Dict;              ///< instance dict, or NULL
   PyObject *WeakRefs;
+  LogicalLineObject *UntrackedPrev; ///< links of the records the collector does not track
+  LogicalLineObject *UntrackedNext; ///< (NULL when tracked)
 };
 
 /// Function table of the capsule. Every function that can fail returns -1 or

@@ -36,20 +36,87 @@ void freeTokens(LogicalLineObject *L) {
   PyMem_Free(Texts);
 }
 
-/// The list in *Slot, created empty on first use (borrowed).
+/// The private list in *Slot, created empty and untracked on first use (borrowed).
 PyObject *derivedList(PyObject **Slot) {
-  if (!*Slot)
+  if (!*Slot) {
     *Slot = require(PyList_New(0)).release();
+    PyObject_GC_UnTrack(*Slot);
+  }
   return *Slot;
+}
+
+/// New reference: Obj (bytes) itself when exact, else an exact copy, so
+/// that nothing in a derived list can refer back to a record.
+Ref exactBytes(PyObject *Obj) {
+  if (PyString_CheckExact(Obj))
+    return Ref::borrow(Obj);
+  return require(PyString_FromStringAndSize(PyString_AS_STRING(Obj), PyString_GET_SIZE(Obj)));
 }
 
 void appendTo(PyObject **Slot, PyObject *Item) {
   tl::requireStatus(PyList_Append(derivedList(Slot), Item));
 }
 
+void appendBytes(PyObject **Slot, PyObject *Text) { appendTo(Slot, exactBytes(Text).get()); }
+
 void appendPair(PyObject **Slot, PyObject *Name, PyObject *Info) {
-  Ref Pair = require(PyTuple_Pack(2, Name, Info));
+  Ref Pair = require(PyTuple_Pack(2, exactBytes(Name).get(), exactBytes(Info).get()));
   appendTo(Slot, Pair.get());
+}
+
+/// New reference: a copy of a derived list (empty when there is none).
+Ref copyOf(PyObject *List) {
+  if (!List)
+    return require(PyList_New(0));
+  return require(PyList_GetSlice(List, 0, PyList_GET_SIZE(List)));
+}
+
+/// New reference: a derived list as a tuple (empty when there is none).
+Ref tupleOf(PyObject *List) {
+  if (!List)
+    return require(PyTuple_New(0));
+  return require(PyList_AsTuple(List));
+}
+
+// ---- records the collector does not track
+
+/// Records built by the splitter are not tracked by the cyclic collector:
+/// they hold bytes, private lists of bytes and pairs of bytes, and their
+/// parents, records of the same split, so they cannot be part of a cycle, and
+/// a host that keeps many of them would otherwise pay for their traversal in
+/// every full collection. Invariant: a record is untracked exactly when it
+/// is linked in the ring through Untracked; the parent chain of an untracked
+/// record holds only untracked records.
+LogicalLineObject Untracked{};
+
+bool isUntracked(LogicalLineObject *L) { return L->UntrackedNext != nullptr; }
+
+void linkUntracked(LogicalLineObject *L) {
+  if (!Untracked.UntrackedNext)
+    Untracked.UntrackedNext = Untracked.UntrackedPrev = &Untracked;
+  L->UntrackedPrev = &Untracked;
+  L->UntrackedNext = Untracked.UntrackedNext;
+  Untracked.UntrackedNext->UntrackedPrev = L;
+  Untracked.UntrackedNext = L;
+}
+
+void unlinkUntracked(LogicalLineObject *L) {
+  L->UntrackedPrev->UntrackedNext = L->UntrackedNext;
+  L->UntrackedNext->UntrackedPrev = L->UntrackedPrev;
+  L->UntrackedPrev = L->UntrackedNext = nullptr;
+}
+
+/// Called before Python code gives an untracked record a reference to
+/// anything: a cycle through it could pass through any record whose parent
+/// chain leads to this one, so every untracked record becomes tracked.
+void beforeArbitraryReference(LogicalLineObject *L) {
+  if (!isUntracked(L))
+    return;
+  while (Untracked.UntrackedNext != &Untracked) {
+    LogicalLineObject *R = Untracked.UntrackedNext;
+    unlinkUntracked(R);
+    PyObject_GC_Track(R);
+  }
 }
 
 Py_ssize_t checkIndex(LogicalLineObject *L, PyObject *Index) {
@@ -130,6 +197,8 @@ constexpr int kMaxFree = 4096;
 
 void logical_dealloc(PyObject *O) {
   LogicalLineObject *L = self(O);
+  if (isUntracked(L))
+    unlinkUntracked(L);
   PyObject_GC_UnTrack(O);
   // Parent chains can be long; the trashcan bounds the C stack.
   Py_TRASHCAN_SAFE_BEGIN(O)
@@ -267,6 +336,8 @@ int set_parent_scope(PyObject *O, PyObject *V, void *) {
     PyErr_SetString(PyExc_TypeError, msg::ParentScope);
     return -1;
   }
+  if (V)
+    beforeArbitraryReference(self(O));
   Py_XINCREF(V);
   Py_XSETREF(self(O)->ParentScope, V);
   return 0;
@@ -277,15 +348,24 @@ PyObject *get_local_scope(PyObject *O, void *) { return optional(self(O)->LocalS
 int set_local_scope(PyObject *O, PyObject *V, void *) {
   if (V == Py_None)
     V = nullptr;
+  if (V && !PyString_CheckExact(V))
+    beforeArbitraryReference(self(O));
   Py_XINCREF(V);
   Py_XSETREF(self(O)->LocalScopeDefined, V);
   return 0;
 }
 
+/// Attributes other than the fields go to the instance dict, where they can
+/// refer to anything; the fields' setters decide for themselves.
+int logical_setattro(PyObject *O, PyObject *Name, PyObject *V) {
+  PyObject *Descr = _PyType_Lookup(Py_TYPE(O), Name); // borrowed
+  if (V && !(Descr && Py_TYPE(Descr)->tp_descr_set))
+    beforeArbitraryReference(self(O));
+  return PyObject_GenericSetAttr(O, Name, V);
+}
+
 template <PyObject *LogicalLineObject::*Field> PyObject *get_list(PyObject *O, void *) {
-  return guard<PyObject *>(nullptr, [&] {
-    return Ref::borrow(derivedList(&(self(O)->*Field))).release();
-  });
+  return guard<PyObject *>(nullptr, [&] { return copyOf(self(O)->*Field).release(); });
 }
 
 // ---- methods
@@ -322,8 +402,25 @@ PyObject *m_append_arg_type_equiv(PyObject *O, PyObject *Args) {
 template <PyObject *LogicalLineObject::*Field> PyObject *m_append_bytes(PyObject *O, PyObject *V) {
   return guard<PyObject *>(nullptr, [&]() -> PyObject * {
     expectBytes(V);
-    appendTo(&(self(O)->*Field), V);
+    appendBytes(&(self(O)->*Field), V);
     Py_RETURN_NONE;
+  });
+}
+
+PyObject *m_get_derived_info(PyObject *O, PyObject *) {
+  return guard<PyObject *>(nullptr, [&]() -> PyObject * {
+    LogicalLineObject *L = self(O);
+    PyObject *Lists[] = {L->NamesDefined, L->TypeEquivs, L->ArgNames, L->ArgTypeEquivs,
+                         L->BaseClassNames};
+    bool Any = false;
+    for (PyObject *List : Lists)
+      Any = Any || (List && PyList_GET_SIZE(List));
+    if (!Any)
+      Py_RETURN_NONE;
+    Ref Result = require(PyTuple_New(5));
+    for (Py_ssize_t I = 0; I < 5; ++I)
+      PyTuple_SET_ITEM(Result.get(), I, tupleOf(Lists[I]).release());
+    return Result.release();
   });
 }
 
@@ -340,6 +437,9 @@ PyMethodDef Methods[] = {
      "AppendBaseClassName(text): appends to fBaseClassNames."},
     {"AppendNameDefined", m_append_bytes<&LogicalLineObject::NamesDefined>, METH_O,
      "AppendNameDefined(name): appends to fNamesDefined."},
+    {"GetDerivedInfo", m_get_derived_info, METH_NOARGS,
+     "GetDerivedInfo() -> None when nothing is recorded, else the tuple (fNamesDefined,\n"
+     "fTypeEquivs, fArgNames, fArgTypeEquivs, fBaseClassNames), each as a tuple."},
     {nullptr, nullptr, 0, nullptr}};
 
 #define TL_GET(Name, Fn, Doc) {const_cast<char *>(Name), Fn, nullptr, const_cast<char *>(Doc), nullptr}
@@ -396,7 +496,7 @@ int appendAttrib(PyObject *Logical, PyObject *Attrib) {
   return guard(-1, [&] {
     LogicalLineObject *L = asLogical(Logical);
     if (PyString_Check(Attrib)) {
-      appendTo(&L->NamesDefined, Attrib);
+      appendBytes(&L->NamesDefined, Attrib);
       return 0;
     }
     if (!PyTuple_Check(Attrib) || PyTuple_GET_SIZE(Attrib) != 2 ||
@@ -405,7 +505,7 @@ int appendAttrib(PyObject *Logical, PyObject *Attrib) {
     PyObject *Name = PyTuple_GET_ITEM(Attrib, 0);
     PyObject *Info = PyTuple_GET_ITEM(Attrib, 1);
     expectBytes(Info);
-    appendTo(&L->NamesDefined, Name);
+    appendBytes(&L->NamesDefined, Name);
     return 0;
   });
 }
@@ -457,13 +557,14 @@ LogicalLineObject *newLogical(TokenArrays &A, int Kind, long FirstLine, long Ind
     std::memset(reinterpret_cast<char *>(L) + sizeof(PyObject), 0,
                 sizeof(LogicalLineObject) - sizeof(PyObject));
     _Py_NewReference(reinterpret_cast<PyObject *>(L));
-    PyObject_GC_Track(L);
   } else {
     PyObject *O = LogicalLineType.tp_alloc(&LogicalLineType, 0);
     if (!O)
       throw tl::PyErrSet();
+    PyObject_GC_UnTrack(O);
     L = self(O);
   }
+  linkUntracked(L);
   A.moveInto(L);
   L->Kind = Kind;
   L->FirstLine = FirstLine;
@@ -502,6 +603,7 @@ int initLogicalLineType() {
   D.Repr = logical_repr;
   D.WeakListOffset = offsetof(LogicalLineObject, WeakRefs);
   LogicalLineType.tp_dictoffset = offsetof(LogicalLineObject, Dict);
+  LogicalLineType.tp_setattro = logical_setattro;
   return tl::readyType(LogicalLineType, D);
 }
 

@@ -71,18 +71,9 @@ def CorpusFiles(version, limit=None, seed=1234):
 
 
 def InAsyncDef(logical):
-    """Whether some enclosing scope of the logical is an async def.
-
-    As in CPython 3.6's tokenizer, async and await are keywords anywhere in
-    the body of an async def, nested scopes included.
-    """
-    scope = logical.fParentScope
-    while scope is not None:
-        tokens = [t for t, _ in scope.fTokens if not t.startswith((b'#', b'\\'))]
-        if tokens[:2] == [b'async', b'def']:
-            return True
-        scope = scope.fParentScope
-    return False
+    """The host's rule (pysource.utils.InAsyncDef): inside an async def body, at any depth."""
+    from pysource.utils import InAsyncDef as rule
+    return rule(logical)
 
 
 def ReadBytes(path):
@@ -103,21 +94,10 @@ def RunOracle(version, script, stdin_data=None):
     return out
 
 
-_kAnalyzers = {}
-kPy3Keywords = ('False', 'None', 'True', 'and', 'as', 'assert', 'break', 'class', 'continue', 'def', 'del',
-                'elif', 'else', 'except', 'finally', 'for', 'from', 'global', 'if', 'import', 'in', 'is',
-                'lambda', 'nonlocal', 'not', 'or', 'pass', 'raise', 'return', 'try', 'while', 'with', 'yield')
-
-
 def Analyzer(version):
-    """A shared CPGenAnalyzerImpl per language version ('2.7', '3.5', '3.6'), Python 3 keywords for 3.x."""
-    if version not in _kAnalyzers:
-        from pysource import treelens
-        triple = tuple(int(p) for p in version.split('.')) + (0,)
-        py3 = version != '2.7'
-        _kAnalyzers[version] = treelens.CPGenAnalyzerImpl(
-            triple, 'Python-Grammar-%s' % version, list(kPy3Keywords) if py3 else None, py3)
-    return _kAnalyzers[version]
+    """The shared CPGenAnalyzerImpl of a language version ('2.7', '3.5', '3.6'), as the API makes it."""
+    from pysource import analysis
+    return analysis.GetAnalyzer(version).Impl()
 
 
 def AnalyzeLine(version, source, in_async_def=False):

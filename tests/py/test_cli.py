@@ -1,14 +1,45 @@
-"""The command line: files and folders, both modes, errors."""
+"""The command line, run as a new user runs it: a subprocess over files, folders and stdin."""
 
-import io
+import json
 import os
+import re
 import shutil
+import subprocess
 import sys
 import tempfile
 import unittest
 
-from pysource import cli
 from tests.py import support
+
+try:
+    from pysource import cli
+except ImportError as _exc:  # native modules not built
+    cli = None
+    _kImportError = str(_exc)
+
+
+def setUpModule():
+    if cli is None:
+        raise unittest.SkipTest('pysource.treelens not importable: %s' % _kImportError)
+
+
+def Treelens(*argv, **kw):
+    """(exit status, stdout, stderr) of the command line."""
+    env = dict(os.environ, PYTHONPATH=support.kRoot)
+    if 'TREELENS_BUILD_DIR' in env:
+        env['TREELENS_BUILD_DIR'] = os.path.abspath(env['TREELENS_BUILD_DIR'])
+    proc = subprocess.Popen([sys.executable, '-m', 'pysource.cli'] + list(argv),
+                            stdin=subprocess.PIPE, stdout=subprocess.PIPE,
+                            stderr=subprocess.PIPE, cwd=kw.get('cwd'), env=env)
+    out, err = proc.communicate(kw.get('stdin', b''))
+    return proc.returncode, out, err
+
+
+def Lossless(text):
+    """The bytes of a JSON text: lone U+DC80..U+DCFF are the bytes that were not UTF-8."""
+    parts = re.split(u'((?<![\ud800-\udbff])[\udc80-\udcff])', text)
+    return b''.join(chr(ord(p) - 0xDC00) if i % 2 else p.encode('utf-8')
+                    for i, p in enumerate(parts))
 
 
 class CliTest(unittest.TestCase):
@@ -19,16 +50,6 @@ class CliTest(unittest.TestCase):
     def tearDown(self):
         shutil.rmtree(self.tmp)
 
-    def Run(self, *argv):
-        out = io.BytesIO()
-        old = sys.stdout
-        sys.stdout = out
-        try:
-            status = cli.Main(list(argv))
-        finally:
-            sys.stdout = old
-        return status, out.getvalue()
-
     def Write(self, rel, text):
         path = os.path.join(self.tmp, rel)
         if not os.path.isdir(os.path.dirname(path)):
@@ -37,63 +58,117 @@ class CliTest(unittest.TestCase):
             f.write(text)
         return path
 
-    def testExampleAnalysedLineByLine(self):
-        example = os.path.join(support.kRoot, 'examples', 'sample.py')
-        for lang in ('2.7', '3.6'):
-            status, out = self.Run('--lang', lang, example)
-            self.assertEqual(status, 0, lang)
-            self.assertIn('== ' + example, out)
-            for expected in ('class   class Point(object):', 'def     def load(',
-                             'try         try:', "tokens: 'import' 'os' '.' 'path' 'as' 'osp'"):
-                self.assertIn(expected, out, (lang, expected))
+    def testTextFormatAndExitStatuses(self):
+        good = self.Write('good.py', b'import os\n\nx = y\n')
+        bad = self.Write('bad.py', b'x = 1\nif x\n')
+        status, out, err = Treelens(good)
+        self.assertEqual(status, 0, err)
+        self.assertEqual(out, good + b':1: [stmt] import os\n    defines: os\n    equivs: os = '
+                         b':i:os\n' + good + b':3: [stmt] x = y\n    defines: x\n    reads: y\n'
+                         b'    equivs: x = y\n')
+        self.assertEqual(err, b'1 files, 3 logical lines, 0 syntax errors, %s seconds\n'
+                         % re.search(br'[0-9.]+ seconds', err).group().split()[0])
+        status, out, err = Treelens('-q', good, bad)
+        self.assertEqual((status, err), (1, b''))
+        self.assertIn(bad + b':2: [stmt] if x\n    error: 2:5: invalid syntax\n', out)
+        for argv in (['--bogus', good], ['-j', '0', good], ['--lang', '3.7', good], []):
+            status, out, err = Treelens(*argv)
+            self.assertEqual((status, out), (2, b''), argv)
+            self.assertIn(b'usage: treelens', err)
 
-    def testFolderSearchedRecursivelyInOrder(self):
-        self.Write('b.py', b'y = 2\n')
-        self.Write('a/inner.py', b'x = 1\n')
-        self.Write('a/notes.txt', b'not python\n')
-        status, out = self.Run('--split-only', self.tmp)
-        self.assertEqual(status, 0)
-        headers = [line for line in out.splitlines() if line.startswith('== ')]
-        self.assertEqual(headers, ['== ' + os.path.join(self.tmp, 'a', 'inner.py'),
-                                   '== ' + os.path.join(self.tmp, 'b.py')])
+    def testErrorsOnlyStdinAndUnreadablePaths(self):
+        # A missing file, a binary file and a dangling link do not stop the others.
+        binary = self.Write('bin.py', b'x = 1\n\x7fELF\x00\x01\n')
+        os.symlink(os.path.join(self.tmp, 'none'), os.path.join(self.tmp, 'link.py'))
+        bad = self.Write('d/bad.py', b'def f(:\n    pass\n')
+        status, out, err = Treelens('--errors-only', '-q', '--lang', '3.6', 'missing.py', binary,
+                                    '-', self.tmp,
+                                    '--stdin-filename', 'in.py', stdin=b'\n\nprint x\n')
+        self.assertEqual(status, 2)
+        self.assertEqual(out, b'in.py:3:7: invalid syntax\n' + bad + b':1:7: invalid syntax\n')
+        self.assertEqual(err.splitlines(), [
+            b'missing.py: error: cannot read: No such file or directory',
+            binary + b': error: not Python source: NUL byte at line 2, column 5',
+            binary + b': error: not Python source: NUL byte at line 2, column 5',
+            os.path.join(self.tmp, 'link.py') + b': error: cannot read: No such file or directory'])
+        status, out, err = Treelens('--errors-only', '--lang', '2.7', '-', stdin=b'print x\n')
+        self.assertEqual((status, out), (0, b''))
 
-    def testSyntaxErrorReportedWithLocation(self):
-        path = self.Write('bad.py', b'x = 1\nif x\n')
-        status, out = self.Run(path)
-        self.assertEqual(status, 0)
-        self.assertIn('error: invalid syntax (line 1, column 5)', out)
+    def testJsonRoundTripsEveryText(self):
+        texts = {'latin1.py': b'# -*- coding: latin-1 -*-\ns = "caf\xe9"\r\nt = "\xed\xa0\x80"\n',
+                 'utf8.py': b'\xef\xbb\xbfs = "\xf0\x9f\x98\x80\xe2\x82\xac"\nu"\\u00e9"\n',
+                 'empty.py': b'',
+                 'long.py': b'x = [' + b'1, ' * 350000 + b']\n',
+                 'mixed.py': b'\tif x:\r  y = (1,\\\n 2)\r# c\n\n'}
+        paths = dict((name, self.Write(name, text)) for name, text in texts.items())
+        status, out, err = Treelens('--format', 'json', '-q', self.tmp)
+        self.assertEqual(status, 0, err)
+        files = json.loads(out)['files']
+        self.assertEqual([f['path'] for f in files], [paths[n] for n in sorted(texts)])
+        status, jsonl, err = Treelens('--format', 'jsonl', '-q', self.tmp)
+        lines = [json.loads(line) for line in jsonl.splitlines()]
+        for name, text in texts.items():
+            entry = [f for f in files if f['path'] == paths[name]][0]
+            self.assertEqual((entry['status'], entry['version'], entry['problem']),
+                             ('ok', '3.6', None), name)
+            bom = 3 if text.startswith(b'\xef\xbb\xbf') else 0
+            self.assertEqual(b''.join(Lossless(l['text']) for l in entry['lines']), text[bom:], name)
+            self.assertEqual([l for l in lines if l['path'] == paths[name]],
+                             [dict(l, path=paths[name], version='3.6') for l in entry['lines']])
+        line = [f for f in files if f['path'] == paths['latin1.py']][0]['lines'][1]
+        self.assertEqual((line['defines'], line['reads'], line['equivs'], line['error']),
+                         (['s'], [], [['s', u':l:string: \'caf\udce9\'']], None))
+        self.assertEqual(sorted(line), ['arg_equivs', 'args', 'bases', 'defines', 'equivs',
+                                        'error', 'kind', 'line', 'reads', 'text'])
 
-    def testMissingFileFailsButOthersRun(self):
-        good = self.Write('ok.py', b'z = 3\n')
-        err = io.BytesIO()
-        old = sys.stderr
-        sys.stderr = err
-        try:
-            status, out = self.Run(os.path.join(self.tmp, 'missing.py'), good)
-        finally:
-            sys.stderr = old
-        self.assertEqual(status, 1)
-        self.assertIn('cannot read', err.getvalue())
-        self.assertIn('== ' + good, out)
+    def testSymlinkLoopAndMixedVersions(self):
+        self.Write('pkg/old.py', b'print "x"\n')
+        self.Write('pkg/new.py', b'print(f"{x}")\n')
+        os.symlink('..', os.path.join(self.tmp, 'pkg', 'up'))
+        status, out, err = Treelens('--format', 'jsonl', '-q', 'pkg', cwd=self.tmp)
+        self.assertEqual(status, 0, err)
+        self.assertEqual([(l['path'], l['version']) for l in map(json.loads, out.splitlines())],
+                         [('pkg/new.py', '3.6'), ('pkg/old.py', '2.7')])
+        self.assertEqual(err, b'pkg/up/pkg: note: symlink loop: folder already being searched, '
+                         b'not followed\n')
 
-    def testPrintFunctionModulesUseTheVariantGrammar(self):
-        body = b'print(x, file=f)\nprint >>f, x\n'
-        path = self.Write('future.py', b'from __future__ import print_function\n' + body)
-        status, out = self.Run(path)
-        lines = [l for l in out.splitlines() if l.startswith('       error')]
-        self.assertEqual(lines, [], out)      # `print >>f, x` is a shift expression there
-        path = self.Write('plain.py', body)
-        status, out = self.Run(path)
-        lines = [l for l in out.splitlines() if l.startswith('       error')]
-        self.assertEqual(len(lines), 1, out)      # only the print call with a keyword fails
-        status, out = self.Run('--lang', '3.6', path)
-        self.assertNotIn('error:', out)       # both are expressions in Python 3
+    def testParallelOutputIsIdentical(self):
+        lib = support.StdlibDir('2.7')
+        some = [os.path.join(lib, 'json'), os.path.join(lib, 'email')]
+        for fmt, paths in (('jsonl', some if support.kSanitized else [lib]), ('text', some)):
+            one = Treelens('-q', '--format', fmt, *paths)
+            two = Treelens('-q', '-j', '2', '--format', fmt, *paths)
+            self.assertEqual(one[0], two[0], fmt)
+            self.assertTrue(one[1] == two[1], fmt)   # (no diff of megabytes)
+            self.assertGreater(len(one[1]), 100000, fmt)
 
-    def testAsyncDefScopeFromParents(self):
-        from pysource import utils
-        logicals = utils.GetLogicalsFromText(
-            b'async def f():\n    await g()\n    def h():\n        await k()\n')
-        self.assertEqual([cli.InAsyncDef(l) for l in logicals], [False, True, True, False])
+
+class ProgressTest(unittest.TestCase):
+
+    class Terminal(object):
+        def __init__(self, tty):
+            self.tty, self.text = tty, ''
+
+        def isatty(self):
+            return self.tty
+
+        def write(self, text):
+            self.text += text
+
+        def flush(self):
+            pass
+
+    def testDrawnOnlyOnATerminalAfterAMoment(self):
+        now = [100.0]
+        for tty, elapsed, drawn in ((True, 0.1, False), (True, 2.0, True), (False, 2.0, False)):
+            stream = self.Terminal(tty)
+            progress = cli.Progress(4, stream, lambda: now[0])
+            now[0] += elapsed
+            progress.Update(2)
+            self.assertEqual(stream.text.startswith('\r[' + '#' * 15 + '.' * 15 + '] 2/4 files'),
+                             drawn, (tty, elapsed))
+            progress.Close()
+            self.assertEqual(stream.text.endswith(' \r'), drawn)
 
 
 if __name__ == '__main__':

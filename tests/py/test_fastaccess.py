@@ -125,12 +125,16 @@ class RecordTest(unittest.TestCase):
         self.assertEqual(L.fArgNames, [b'self'])
         self.assertEqual(L.fArgTypeEquivs, [(b'self', b':c A')])
         self.assertEqual(L.fBaseClassNames, [b'object'])
-        names = L.fNamesDefined
+        self.assertEqual(L.GetDerivedInfo(), ((b'a', b'b', b'os'), tuple(L.fTypeEquivs),
+                                              (b'self',), ((b'self', b':c A'),), (b'object',)))
+        names = L.fNamesDefined       # a copy: the record's own lists stay private
+        names.append(L)
         self.assertIsNone(fa.ClearLogicalDerivedInfo(L))
         for attr in ('fNamesDefined', 'fTypeEquivs', 'fArgNames', 'fArgTypeEquivs',
                      'fBaseClassNames'):
             self.assertEqual(getattr(L, attr), [], attr)
-        self.assertEqual(names, [])
+        self.assertEqual(names, [b'a', b'b', b'os', L])
+        self.assertIsNone(L.GetDerivedInfo())
         fa.ClearLogicalDerivedInfo(L)
 
     def testOperationErrors(self):
@@ -347,6 +351,63 @@ class LeakTest(unittest.TestCase):
 def Rss():
     with open('/proc/self/statm') as f:
         return int(f.read().split()[1]) * 4096
+
+
+class UntrackedRecordTest(unittest.TestCase):
+    """Split records are not tracked by the collector until Python code gives
+    one of them a reference that could close a cycle."""
+
+    kText = b'class A:\n    def f(self):\n        x = 1\n'
+
+    def Collected(self, make_cycle):
+        gc.collect()
+        records = GetLogicalsFromText(self.kText)
+        refs = map(weakref.ref, records)
+        make_cycle(records)
+        del records
+        gc.collect()
+        return [ref() is None for ref in refs]
+
+    def testRecordsAndTheirInfoStayUntracked(self):
+        records = GetLogicalsFromText(self.kText)
+        L = records[2]
+        L.fInspected = True
+        L.fLocalScopeDefined = b'A.f'
+        L.AppendNameDefined(b'x')
+        L.AppendTypeEquiv(b'x', b':l:int: 1')
+        fa.AppendLogicalAttrib(L, (b'os', b':m os'))
+        L.fTokens
+        self.assertEqual([gc.is_tracked(r) for r in records], [False] * 3)
+        self.assertEqual(L.fNamesDefined, [b'x', b'os'])
+
+    def testCyclesThroughPythonReferencesAreCollected(self):
+        class Text(bytes):
+            pass
+
+        def through_subclass_text(records):
+            text = Text(b'n')
+            text.back = records[1]
+            records[2].AppendNameDefined(text)  # stored as an exact copy
+            records[2].AppendArgTypeEquiv(text, text)
+            fa.AppendLogicalAttrib(records[2], (text, text))
+            records[0].keep = text
+
+        cases = [
+            ('attribute', lambda rs: setattr(rs[0], 'children', rs)),
+            ('parent', lambda rs: setattr(rs[0], 'fParentScope', rs[2])),
+            ('scope name', lambda rs: setattr(rs[1], 'fLocalScopeDefined', [rs[2]])),
+            ('subclass text', through_subclass_text),
+        ]
+        for name, make_cycle in cases:
+            self.assertEqual(self.Collected(make_cycle), [True] * 3, name)
+
+    def testTrackingIsNeededOnlyOnce(self):
+        old = GetLogicalsFromText(self.kText)
+        old[0].children = old
+        self.assertEqual([gc.is_tracked(r) for r in old], [True] * 3)
+        new = GetLogicalsFromText(self.kText)
+        self.assertEqual([gc.is_tracked(r) for r in new], [False] * 3)
+        old[0].children = None
 
 
 if __name__ == '__main__':

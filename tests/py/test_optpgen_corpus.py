@@ -60,16 +60,10 @@ def GrammarFor(version):
     return _gGrammars[version]
 
 
-def _InAsyncDef(logical):
-    """True inside an async def, and on the async def line itself (the
-    caller of the analysis module decides the same)."""
-    scope = logical
-    while scope is not None:
-        toks = scope.fTokens
-        if toks and toks[0][0] == 'async':
-            return True
-        scope = scope.fParentScope
-    return False
+def _AsyncKeywords(logical):
+    """Whether async and await are keywords in the logical: inside an async
+    def body (the host's rule), or on the async def line itself."""
+    return support.InAsyncDef(logical) or (logical.fKind == 2 and utils._StartsAsyncDef(logical))
 
 
 def LogicalTokens(logical, py3_grammar):
@@ -80,7 +74,7 @@ def LogicalTokens(logical, py3_grammar):
         return None
     pairs = logical.fTokens
     n = len(pairs)
-    async_kw = py3_grammar and _InAsyncDef(logical)
+    async_kw = py3_grammar and _AsyncKeywords(logical)
     out = []
     add = out.append
     first = True

@@ -22,7 +22,7 @@ from tests.py import support
 
 try:
     from pysource import treelens as tl
-    from pysource import cli
+    from pysource import analysis
     from pysource import symbolinfo as si
     from pysource.utils import GetLogicalsFromText
     sys.path.insert(0, os.path.join(support.kRoot, 'bench'))
@@ -162,16 +162,16 @@ def Compiles27(source):
 class Corpus27Test(unittest.TestCase):
 
     def testStdlib(self):
-        analyzers = cli.Analyzers('2.7')
+        analyzer = analysis.GetAnalyzer('2.7')
         files = support.CorpusFiles('2.7')
         wrong, judged, print_function_files, rejected_files, counts = [], [], 0, 0, []
         for path in files:
             text = support.ReadBytes(path)
             logicals = GetLogicalsFromText(text)
-            uses_print_function = cli.UsesPrintFunction(logicals)
+            uses_print_function = analysis.UsesPrintFunction(logicals)
             print_function_files += uses_print_function
             analyzed = []
-            failed = Analyze(analyzers.ForModule(logicals), text, False, counts, analyzed)
+            failed = Analyze(analyzer.ImplFor(logicals), text, False, counts, analyzed)
             if not uses_print_function:  # ast.parse has no print_function flag here
                 JudgeByAst(path, analyzed, lambda srcs: [astfacts.Facts(s) for s in srcs], judged)
             if Compiles27(text):
@@ -193,7 +193,7 @@ class Corpus36Test(unittest.TestCase):
         files = support.CorpusFiles('3.6')
         if not files or support.Interpreter('3.6') is None:
             self.skipTest('no Python 3.6 standard library')
-        analyzer = tl.CPGenAnalyzerImpl((3, 6, 0), 'Python-Grammar-3.6', cli.kPy3Keywords, True)
+        analyzer = analysis.GetAnalyzer('3.6').ImplFor([])
         texts = [(path, support.ReadBytes(path)) for path in files]
         compiling = OracleCompiles('3.6', texts)
         wrong, judged, suspects, counts = [], [], [], []

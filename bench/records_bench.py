@@ -1,0 +1,84 @@
+"""Logical-line records: the cost of keeping them, and splitting time against input size.
+
+1. Splitting the 2.7 standard library with GetLogicalsFromText, dropping each
+   file's records before the next, against keeping every record alive (as a
+   host that holds its open files does), with the cyclic collector on: MB/s
+   of each and their ratio. Split records are not tracked by the collector,
+   so keeping them costs their memory, not repeated traversals.
+2. Splitting time of texts of n (1 MB) and 8n bytes made of one repeated
+   piece (blank lines, \\r line ends, comments, backslash continuations,
+   open brackets, an unterminated string): a linear splitter takes about 8
+   times as long for the larger one; above 10 is reported as not linear.
+   This part runs in a child process whose allocator keeps freed memory
+   (glibc's MALLOC_MMAP_THRESHOLD_ and MALLOC_TRIM_THRESHOLD_), best of
+   `repeat`: on a virtual machine a page fault of fresh memory can cost more
+   than splitting the bytes it holds, and would be measured instead.
+
+Usage: TREELENS_BUILD_DIR=<build> python2.7 bench/records_bench.py [repeat]
+"""
+
+import gc
+import os
+import subprocess
+import sys
+import time
+
+sys.path.insert(0, os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
+
+from tests.py import support  # noqa: E402
+from pysource.utils import GetLogicalsFromText  # noqa: E402
+
+kPieces = [('blank lines', b'\n'), ('\\r line ends', b'x = 1\r'), ('comments', b'# note\n'),
+           ('backslashes', b'x = \\\n'), ('open brackets', b'f(a,\n'), ('nested brackets', b'(['),
+           ('open string', b'"""x\n')]
+kLarge = 1 << 20
+
+
+def SplitTime(texts, keep):
+    gc.collect()
+    kept = []
+    start = time.time()
+    for text in texts:
+        records = GetLogicalsFromText(text)
+        if keep:
+            kept.append(records)
+    elapsed = time.time() - start
+    del kept
+    return elapsed
+
+
+def main():
+    if sys.argv[1:2] == ['--linearity']:
+        return Linearity(int(sys.argv[2]))
+    repeat = int(sys.argv[1]) if len(sys.argv) > 1 else 3
+    texts = [support.ReadBytes(p) for p in support.CorpusFiles('2.7')]
+    size = sum(map(len, texts)) / 1e6
+    drop = keep = float('inf')
+    for _ in range(repeat):
+        drop = min(drop, SplitTime(texts, False))
+        keep = min(keep, SplitTime(texts, True))
+    print('%d files, %.1f MB, best of %d, collector on' % (len(texts), size, repeat))
+    print('%-28s %10s' % ('', 'MB/s'))
+    print('%-28s %10.1f' % ('split, records dropped', size / drop))
+    print('%-28s %10.1f' % ('split, every record kept', size / keep))
+    print('kept over dropped: %.0f%%' % (100 * drop / keep))
+    print('')
+    sys.stdout.flush()
+    env = dict(os.environ, MALLOC_MMAP_THRESHOLD_=str(1 << 30), MALLOC_TRIM_THRESHOLD_=str(1 << 31))
+    subprocess.check_call([sys.executable, __file__, '--linearity', str(repeat)], env=env)
+
+
+def Linearity(repeat):
+    print('%-18s %10s %10s %8s' % ('n = 1 MB of', 'n (ms)', '8n (ms)', 'ratio'))
+    for name, piece in kPieces:
+        small = piece * (kLarge // len(piece))
+        large = small * 8
+        t_small = min(SplitTime([small], False) for _ in range(repeat))
+        t_large = min(SplitTime([large], False) for _ in range(repeat))
+        ratio = t_large / max(t_small, 1e-6)
+        print('%-18s %10.1f %10.1f %8.1f%s' % (name, 1e3 * t_small, 1e3 * t_large, ratio,
+                                              '' if ratio <= 10 else '  NOT LINEAR'))
+
+
+if __name__ == '__main__':
+    main()

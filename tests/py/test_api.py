@@ -1,0 +1,209 @@
+"""pysource.analysis: versions, auto, the async rule, texts, files, folders and the plain-data view."""
+
+import os
+import shutil
+import tempfile
+import unittest
+
+from tests.py import support
+
+try:
+    from pysource import analysis, symbolinfo, treelens, utils
+except ImportError as _exc:  # native modules not built
+    analysis = None
+    _kImportError = str(_exc)
+
+
+def setUpModule():
+    if analysis is None:
+        raise unittest.SkipTest('pysource.treelens not importable: %s' % _kImportError)
+
+
+def Errors(text, version):
+    return [(line, col) for line, col, _ in analysis.AnalyzeText(text, version).SyntaxErrors()]
+
+
+class VersionTest(unittest.TestCase):
+
+    def testEachVersionAcceptsItsOwnSyntax(self):
+        # source, versions that accept it
+        cases = [(b'print x\n', '2.7'),
+                 (b'exec "x" in d\n', '2.7'),
+                 (b'x = 0777 + 10L + 0xFFL\n', '2.7'),
+                 (b"x = ur'a' if a <> b else 1\n", '2.7'),
+                 (b"x = '\\u00e9'; y = b'\\u'; z = r'\\N'\n", '2.7 3.5 3.6'),
+                 (b"x = '\\u'\n", '2.7'),
+                 (b"x = '\\N{DASH}'\n", '2.7 3.5 3.6'),
+                 (b'x = 1_000\n', '3.6'),
+                 (b"x = f'{y}'\n", '3.6'),
+                 (b'x: int = 1\n', '3.6'),
+                 (b"x = rb'a'\n", '3.5 3.6'),
+                 (b'print(x, file=f)\n', '3.5 3.6'),
+                 (b'from __future__ import print_function\nprint(x, file=f)\n', '2.7 3.5 3.6'),
+                 (b'x = 0; y = 00; z = 0.5 + 07.5 + 0e1 + 0777j\n', '2.7 3.5 3.6')]
+        for text, accepting in cases:
+            for version in analysis.kVersions:
+                errors = Errors(text, version)
+                self.assertEqual(errors == [], version in accepting, (text, version, errors))
+
+    def testTokenErrorsPointAtTheToken(self):
+        result = analysis.AnalyzeText(b'x = 1\ny = (1 +\n     0777)\n', '3.6')
+        self.assertEqual(result.SyntaxErrors(), [(3, 6, 'invalid token')])
+        self.assertEqual(result.logicals[1].GetDerivedInfo(), None)
+
+    def testAsyncRuleIsCPython36s(self):
+        text = (b'async def f():\n'
+                b'    await g()\n'
+                b'    def h():\n'
+                b'        await k()\n'
+                b'    class C:\n'
+                b'        @d\n'
+                b'        def m(self): return await x\n'
+                b'async  \\\n'
+                b'  def e(): pass\n'
+                b'await = 1\n')
+        logicals = utils.GetLogicalsFromText(text)
+        self.assertEqual([utils.InAsyncDef(l) for l in logicals],
+                         [False, True, True, True, True, True, True, False, False])
+        self.assertEqual(Errors(text, '3.6'), [])
+        self.assertEqual(Errors(text, '3.5'), [])
+
+    def testAutoPicksTheNewestVersionWithoutErrors(self):
+        # source, version picked, errors kept
+        cases = [(b'', '3.6', []),
+                 (b'x = 1\n', '3.6', []),
+                 (b'x = 1\nprint x\n', '2.7', []),
+                 (b'def f():\n    x = 0777\n', '2.7', []),
+                 (b'print(x, end="")\nx = 1_0\n', '3.6', []),
+                 (b'print x\ny = f"{x}"\n', '3.6', [(1, 7)]),
+                 (b'if x\n', '3.6', [(1, 5)])]
+        for text, version, errors in cases:
+            result = analysis.AnalyzeText(text)
+            self.assertEqual((result.version, Errors(text, result.version)), (version, errors), text)
+            self.assertEqual(result.status, analysis.kSyntaxError if errors else analysis.kOk)
+            self.assertEqual(result.SyntaxErrors() != [], errors != [])
+
+
+class StdlibAutoTest(unittest.TestCase):
+    """auto picks the version that compiles a file when only one of 2.7 and 3.6 does."""
+
+    kCompileScript = r'''
+import sys
+for path in sys.stdin.read().splitlines():
+    try:
+        with open(path, 'rb') as f:
+            compile(f.read(), path, 'exec', dont_inherit=True)
+        sys.stdout.write(path + '\n')
+    except Exception:
+        pass
+'''
+
+    def Compiling(self, version, files):
+        if version == '2.7':
+            return set(p for p in files if Compiles27(support.ReadBytes(p)))
+        out = support.RunOracle(version, self.kCompileScript, '\n'.join(files))
+        if out is None:
+            self.skipTest('no Python %s' % version)
+        return set(out.splitlines())
+
+    def testOnlyOneVersionCompiles(self):
+        for lib, other in (('2.7', '3.6'), ('3.6', '2.7')):
+            files = support.CorpusFiles(lib)
+            if not files:
+                continue
+            only = self.Compiling(lib, files) - self.Compiling(other, files)
+            wrong = [(p, r.version) for p in sorted(only)
+                     for r in [analysis.AnalyzeFile(p)] if r.version != lib]
+            self.assertGreater(len(only), 10 if support.kSanitized else 300, lib)
+            self.assertEqual(wrong, [], lib)
+
+
+def Compiles27(source):
+    try:
+        compile(source, '<s>', 'exec', 0, True)
+        return True
+    except (SyntaxError, ValueError, TypeError):
+        return False
+
+
+class ViewTest(unittest.TestCase):
+
+    def testViewOfOneRecord(self):
+        result = analysis.AnalyzeText(b'import os\n\nclass C(B):\n    def f(self, a=1):\n'
+                                      b'        x = y\n        if x\n', '3.6')
+        views = result.Lines()
+        self.assertEqual([(v['line'], v['kind']) for v in views],
+                         [(1, 'stmt'), (2, 'blank'), (3, 'class'), (4, 'def'), (5, 'stmt'),
+                          (6, 'stmt')])
+        self.assertEqual(b''.join(v['text'] for v in views), b''.join(l.fLineText
+                                                                     for l in result.logicals))
+        self.assertEqual(views[2]['bases'], [b'B'])
+        self.assertEqual((views[3]['args'], views[3]['arg_equivs']),
+                         ([b'self', b'a'], [(b'a', symbolinfo.BuildLiteralInfo(b'int', b'1'))]))
+        self.assertEqual((views[4]['defines'], views[4]['reads'], views[4]['equivs']),
+                         ([b'x'], [b'y'], [(b'x', b'y')]))
+        self.assertEqual(views[5]['error'], {'message': 'invalid syntax', 'line': 6, 'column': 13})
+        self.assertEqual((views[5]['defines'], views[5]['reads']), ([], []))
+
+    def testReadsAreTheGetInfos(self):
+        logical = utils.GetLogicalsFromText(b'x = y\n')[0]
+        logical.AppendTypeEquiv(b'y', symbolinfo.kGetPrefix)
+        logical.AppendTypeEquiv(b'x', b'y')
+        view = analysis.LineView(logical)
+        self.assertEqual((view['reads'], view['equivs']), ([b'y'], [(b'x', b'y')]))
+
+    def testSameRecordsAsTheAnalyzerByHand(self):
+        texts = [support.ReadBytes(os.path.join(support.kRoot, 'examples', name))
+                 for name in sorted(os.listdir(os.path.join(support.kRoot, 'examples')))]
+        texts += [support.ReadBytes(p) for p in support.CorpusFiles('3.6', limit=5)]
+        for text in texts:
+            for version in ('2.7', '3.6'):
+                impl = treelens.CPGenAnalyzerImpl(
+                    analysis.kGrammars[version][0], analysis.kGrammars[version][1],
+                    list(analysis.kPy3Keywords) if version != '2.7' else None,
+                    version != '2.7', 'Python-Grammar-3.6')
+                logicals = utils.GetLogicalsFromText(text)
+                by_hand = [analysis.LineView(l, impl.AnalyzeSingleLogical(
+                    l, version != '2.7' and utils.InAsyncDef(l))) for l in logicals]
+                self.assertEqual(analysis.AnalyzeText(text, version).Lines(), by_hand, version)
+
+    def testTextsThatAreNotSource(self):
+        result = analysis.AnalyzeText(b'x = 1\ny = "\0"\n')
+        self.assertEqual((result.status, result.problem, result.logicals),
+                         (analysis.kUnreadable, 'not Python source: NUL byte at line 2, column 6',
+                          []))
+        self.assertEqual(analysis.AnalyzeText(u'x = "\xe9"\n').logicals[0].fLineText,
+                         b'x = "\xc3\xa9"\n')
+
+
+class FolderTest(unittest.TestCase):
+
+    def setUp(self):
+        self.tmp = tempfile.mkdtemp()
+        for rel in ('b.py', 'a/z.pyi', 'a/y.py', 'a/notes.txt', '.hidden/h.py', 'a/.x.py'):
+            path = os.path.join(self.tmp, rel)
+            if not os.path.isdir(os.path.dirname(path)):
+                os.makedirs(os.path.dirname(path))
+            with open(path, 'wb') as f:
+                f.write(b'print x\n' if rel == 'b.py' else b'x = 1\n')
+        os.symlink(self.tmp, os.path.join(self.tmp, 'a', 'loop'))
+        os.symlink(os.path.join(self.tmp, 'missing'), os.path.join(self.tmp, 'a', 'gone.py'))
+
+    def tearDown(self):
+        shutil.rmtree(self.tmp)
+
+    def testFolderInOrderWithProblemsReported(self):
+        got = [(os.path.relpath(r.path, self.tmp), r.version, r.status)
+               for r in analysis.AnalyzeFolder(self.tmp)]
+        self.assertEqual(got, [('a/gone.py', None, analysis.kUnreadable),
+                               ('a/loop', None, analysis.kSkipped),
+                               ('a/y.py', '3.6', analysis.kOk),
+                               ('a/z.pyi', '3.6', analysis.kOk),
+                               ('b.py', '2.7', analysis.kOk)])
+        self.assertEqual(analysis.WorstStatus(s for _, _, s in got), analysis.kUnreadable)
+        result = analysis.AnalyzeFile(os.path.join(self.tmp, 'a', 'gone.py'))
+        self.assertEqual(result.problem, 'cannot read: No such file or directory')
+
+
+if __name__ == '__main__':
+    unittest.main()
