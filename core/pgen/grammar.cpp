@@ -121,6 +121,9 @@ std::unique_ptr<Grammar> Grammar::compile(const GrammarSource &Src,
     G->Dfas.push_back(Out);
   }
 
+  if (!G->checkFirstSets(Src, Error))
+    return nullptr;
+
   for (int &T : G->TokenLabels)
     T = -1;
   for (const auto &T : Src.Tokens) {
@@ -206,6 +209,70 @@ std::unique_ptr<Grammar> Grammar::compile(const GrammarSource &Src,
   }
   G->Start = Src.Start;
   return G;
+}
+
+// FIRST(D) = the token labels of the arcs out of D's first state, plus
+// FIRST(X) of each symbol X such an arc pushes (label 0, the accept marker,
+// left out on both sides). The driver relies on the declared sets: a symbol
+// pushed for a token it cannot take pops again without consuming it.
+bool Grammar::checkFirstSets(const GrammarSource &Src, std::string &Error) const {
+  const size_t Words = (LabelCount + 63) / 64;
+  std::vector<uint64_t> Computed(Dfas.size() * Words, 0);
+  enum : uint8_t { Unseen, Open, Closed };
+  std::vector<uint8_t> Mark(Dfas.size(), Unseen);
+  // Depth-first over pushes, with an explicit stack: (DFA, next arc).
+  std::vector<std::pair<uint32_t, uint32_t>> Stack;
+  for (uint32_t Root = 0; Root < Dfas.size(); ++Root) {
+    if (Mark[Root] != Unseen)
+      continue;
+    Mark[Root] = Open;
+    Stack.emplace_back(Root, 0);
+    while (!Stack.empty()) {
+      const uint32_t D = Stack.back().first;
+      const State &St = States[Dfas[D].FirstState];
+      uint32_t &K = Stack.back().second;
+      if (K == St.NumArcs) {
+        Mark[D] = Closed;
+        Stack.pop_back();
+        if (!Stack.empty()) {
+          const uint32_t Parent = Stack.back().first;
+          for (size_t W = 0; W < Words; ++W)
+            Computed[Parent * Words + W] |= Computed[D * Words + W];
+          ++Stack.back().second;
+        }
+        continue;
+      }
+      const Arc &A = Arcs[St.FirstArc + K];
+      if (A.Push < 0) {
+        if (A.Label != 0)
+          Computed[D * Words + (A.Label >> 6)] |= uint64_t(1) << (A.Label & 63);
+        ++K;
+        continue;
+      }
+      const uint32_t X = static_cast<uint32_t>(A.Push);
+      if (Mark[X] == Open) {
+        Error = "left-recursive symbol " + std::to_string(Dfas[X].Symbol);
+        return false;
+      }
+      if (Mark[X] == Closed) {
+        for (size_t W = 0; W < Words; ++W)
+          Computed[D * Words + W] |= Computed[X * Words + W];
+        ++K;
+        continue;
+      }
+      Mark[X] = Open;
+      Stack.emplace_back(X, 0);
+    }
+  }
+  for (size_t D = 0; D < Dfas.size(); ++D)
+    for (size_t W = 0; W < Words; ++W) {
+      uint64_t Mask = W == 0 ? ~uint64_t(1) : ~uint64_t(0);
+      if ((Computed[D * Words + W] ^ FirstBits[Dfas[D].FirstSet + W]) & Mask) {
+        Error = "first set disagrees with the arcs of symbol " + std::to_string(Src.Dfas[D].Symbol);
+        return false;
+      }
+    }
+  return true;
 }
 
 const Grammar::Arc *Grammar::firstArc(uint32_t S, uint32_t L) const {

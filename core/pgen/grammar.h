@@ -129,6 +129,9 @@ public:
 private:
   Grammar() = default;
   int keywordLabel(const char *Text, size_t Len) const;
+  /// False, with a message, when a declared first set differs from the one
+  /// the arcs give or a symbol is left-recursive.
+  bool checkFirstSets(const GrammarSource &Src, std::string &Error) const;
   /// First arc of state S that takes label L, directly or by a push.
   const Arc *firstArc(uint32_t S, uint32_t L) const;
   /// Pool offset of each distinct move, while compiling.

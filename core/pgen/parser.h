@@ -19,12 +19,18 @@ enum class Status {
   BadToken,     ///< the grammar has no label for the token
   TooMuchInput, ///< a token after the start symbol was complete
   TooDeep,      ///< more than MaxDepth nonterminals open
+  NoProgress,   ///< the grammar pushes and pops without taking the token
   Aborted,      ///< the sink refused a callback
   NotReady,     ///< no setup() since construction or since the last error
 };
 
 /// Open nonterminals allowed at once; the bound of CPython's own parser.
 constexpr size_t MaxParseDepth = 1500;
+
+/// Pushes and pops one token may cause at most. A compiled grammar needs at
+/// most the pops of the open frames, one push chain and the pops after the
+/// shift; first sets that disagree with the arcs would loop forever.
+constexpr size_t MaxStepsPerToken = 4 * MaxParseDepth;
 
 /// Drives one parse at a time over a shared Grammar.
 ///
@@ -67,7 +73,9 @@ public:
     if (L < 0)
       return fail(Status::BadToken);
     const uint32_t Terminal = G.terminalOf(static_cast<uint32_t>(L));
-    for (;;) {
+    for (size_t Steps = 0;; ++Steps) {
+      if (Steps == MaxStepsPerToken)
+        return fail(Status::NoProgress);
       uint32_t M = G.move(top().State, Terminal);
       if (M < Grammar::MoveFirst) {
         // No arc takes the token: an accepting state pops, else an error.

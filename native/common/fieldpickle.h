@@ -35,19 +35,26 @@ enum class FieldKind {
 };
 
 /// One pickled field. For Object fields, Type (when set) is the type the value
-/// must have (subclasses allowed); None is always accepted.
+/// must have (subclasses allowed); None is always accepted. ItemType (when
+/// set, with Type a list type) is the type every item must have.
 struct FieldSpec {
   const char *Name;
   FieldKind Kind;
   Py_ssize_t Offset;
   PyTypeObject *Type = nullptr;
+  PyTypeObject *ItemType = nullptr;
 };
+
+/// Raises the error of an object that may not be changed now (mid-operation);
+/// registered per type, nullptr when it never refuses.
+using BusyCheck = void (*)(PyObject *Self);
 
 /// The registered fields of one native type, sorted by name.
 struct PickleSpec {
   std::vector<FieldSpec> Fields;
   uint32_t Checksum = 0;
   std::string FieldList; ///< "(a, b, c)"
+  BusyCheck Busy = nullptr;
 };
 
 /// FNV-1a over the sorted field names, each followed by a comma.
@@ -102,14 +109,28 @@ inline Ref getField(PyObject *Self, const FieldSpec &F) {
   return Ref::borrow(Py_None);
 }
 
+/// Raises TypeError unless Value (borrowed) may be stored in an Object field.
+inline void checkObjectField(const FieldSpec &F, PyObject *Value) {
+  if (F.Kind != FieldKind::Object || Value == Py_None)
+    return;
+  if (F.Type && !PyObject_TypeCheck(Value, F.Type))
+    raiseFormat(PyExc_TypeError, "Cannot convert %.200s to %.200s", Py_TYPE(Value)->tp_name,
+                F.Type->tp_name);
+  if (F.ItemType && PyList_Check(Value))
+    for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Value); ++I) {
+      PyObject *Item = PyList_GET_ITEM(Value, I);
+      if (!PyObject_TypeCheck(Item, F.ItemType))
+        raiseFormat(PyExc_TypeError, "Cannot convert %.200s to %.200s in %.200s",
+                    Py_TYPE(Item)->tp_name, F.ItemType->tp_name, F.Name);
+    }
+}
+
 /// Stores Value (borrowed) into one field after checking its type.
 inline void setField(PyObject *Self, const FieldSpec &F, PyObject *Value) {
   char *A = fieldAddress(Self, F);
   switch (F.Kind) {
   case FieldKind::Object: {
-    if (F.Type && Value != Py_None && !PyObject_TypeCheck(Value, F.Type))
-      raiseFormat(PyExc_TypeError, "Cannot convert %.200s to %.200s", Py_TYPE(Value)->tp_name,
-                  F.Type->tp_name);
+    checkObjectField(F, Value);
     PyObject *Old = *reinterpret_cast<PyObject **>(A);
     Py_INCREF(Value);
     *reinterpret_cast<PyObject **>(A) = Value == Py_None ? nullptr : Value;
@@ -190,6 +211,13 @@ inline PyObject *pickleSetState(PyObject *Self, PyObject *State) {
     if (Got != N && Got != N + 1)
       raiseFormat(PyExc_ValueError, "%.200s state needs %zd values %.400s, got %zd",
                   Py_TYPE(Self)->tp_name, N, Spec->FieldList.c_str(), Got);
+    if (Spec->Busy)
+      Spec->Busy(Self);
+    // The state tuple is held: a field's old value, released as it is
+    // replaced, may run Python code.
+    Ref Hold = Ref::borrow(State);
+    for (Py_ssize_t I = 0; I < N; ++I)
+      checkObjectField(Spec->Fields[I], PyTuple_GET_ITEM(State, I));
     for (Py_ssize_t I = 0; I < N; ++I)
       setField(Self, Spec->Fields[I], PyTuple_GET_ITEM(State, I));
     if (Got == N + 1) {
@@ -237,7 +265,8 @@ inline PyMethodDef unpickleMethodDef() {
 
 /// Registers T's fields (after PyType_Ready) and gives T __reduce__ and
 /// __setstate__. UnpickleFunc is the module's _UnpickleFields (borrowed, kept).
-inline void registerPickle(PyTypeObject &T, std::vector<FieldSpec> Fields, PyObject *UnpickleFunc) {
+inline void registerPickle(PyTypeObject &T, std::vector<FieldSpec> Fields, PyObject *UnpickleFunc,
+                           BusyCheck Busy = nullptr) {
   std::sort(Fields.begin(), Fields.end(),
             [](const FieldSpec &A, const FieldSpec &B) { return std::strcmp(A.Name, B.Name) < 0; });
   PickleSpec Spec;
@@ -250,6 +279,7 @@ inline void registerPickle(PyTypeObject &T, std::vector<FieldSpec> Fields, PyObj
   }
   Spec.FieldList += ")";
   Spec.Fields = std::move(Fields);
+  Spec.Busy = Busy;
   pickleRegistry()[&T] = std::move(Spec);
   if (!unpickleFunction()) {
     Py_INCREF(UnpickleFunc);

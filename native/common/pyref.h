@@ -104,6 +104,32 @@ inline void expectType(bool Ok, const char *What, PyObject *Got) {
                 Py_TYPE(Got)->tp_name);
 }
 
+/// Native levels a recursion over caller-reachable structure (node trees,
+/// raw trees, chains of links) may nest in all; the parse engine's nesting
+/// bound, so every tree the parser builds fits.
+constexpr int MaxNativeNesting = 1500;
+
+/// One level of such a recursion: RuntimeError past MaxNativeNesting levels,
+/// so a deep or cyclic structure raises instead of overflowing the C stack,
+/// whatever recursion limit the caller set. Where names the walk.
+class NestingGuard {
+public:
+  explicit NestingGuard(const char *Where) {
+    if (depth() >= MaxNativeNesting)
+      raiseFormat(PyExc_RuntimeError, "maximum recursion depth exceeded %.100s", Where);
+    ++depth();
+  }
+  ~NestingGuard() { --depth(); }
+  NestingGuard(const NestingGuard &) = delete;
+  NestingGuard &operator=(const NestingGuard &) = delete;
+
+private:
+  static int &depth() {
+    static int Depth = 0;
+    return Depth;
+  }
+};
+
 } // namespace tl
 
 #endif

@@ -10,6 +10,7 @@ constexpr const char *BadInput = "bad input";
 constexpr const char *BadToken = "bad token";
 constexpr const char *TooMuchInput = "too much input";
 constexpr const char *TooDeep = "too much nesting";
+constexpr const char *NoProgress = "grammar makes no progress on token";
 
 // Misuse of a parser or converter.
 constexpr const char *NotReady =

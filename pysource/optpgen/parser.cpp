@@ -253,6 +253,8 @@ const char *statusMessage(pgen::Status S) {
     return msg::TooMuchInput;
   case pgen::Status::TooDeep:
     return msg::TooDeep;
+  case pgen::Status::NoProgress:
+    return msg::NoProgress;
   default:
     return nullptr;
   }
@@ -336,6 +338,8 @@ void setupParser(PyObject *Self, PyObject *Start) {
       throw tl::PyErrSet();
   }
   BusyScope Busy(P);
+  // Whatever follows fails or succeeds, the previous input is gone.
+  P.Driver.reset();
   P.clearTree();
   P.Native = P.Raw ? nullptr : nativeConvertOf(P.Converter);
   if (Symbol < pgen::FirstSymbol || Symbol > 0x7fffffffL ||
@@ -518,16 +522,20 @@ PyObject *feedTokens(PyObject *, PyObject *Args) {
     Ref Seq = require(PySequence_Fast(Tokens, "tokens must be a sequence"));
     setupParser(Self, Py_None);
     Ref Result = Ref::borrow(Py_False);
-    PyObject **Items = PySequence_Fast_ITEMS(Seq.get());
-    const Py_ssize_t N = PySequence_Fast_GET_SIZE(Seq.get());
-    prefetchFirst(Items, N);
-    for (Py_ssize_t I = 0; I < N; ++I) {
-      prefetchNext(Items, I, N);
-      PyObject *T = Items[I];
-      if (!PyTuple_Check(T) || PyTuple_GET_SIZE(T) != 3)
-        tl::expectType(false, "a (type, value, context) tuple", T);
-      Result = require(addToken(Self, PyTuple_GET_ITEM(T, 0),
-                                PyTuple_GET_ITEM(T, 1), PyTuple_GET_ITEM(T, 2)));
+    prefetchFirst(PySequence_Fast_ITEMS(Seq.get()),
+                  PySequence_Fast_GET_SIZE(Seq.get()));
+    // A converter may change a list while it is fed (as a for loop over it
+    // would see): the size and the item array are read again after each
+    // token, and the token tuple is held while it is added.
+    for (Py_ssize_t I = 0; I < PySequence_Fast_GET_SIZE(Seq.get()); ++I) {
+      PyObject **Items = PySequence_Fast_ITEMS(Seq.get());
+      prefetchNext(Items, I, PySequence_Fast_GET_SIZE(Seq.get()));
+      Ref T = Ref::borrow(Items[I]);
+      if (!PyTuple_Check(T.get()) || PyTuple_GET_SIZE(T.get()) != 3)
+        tl::expectType(false, "a (type, value, context) tuple", T.get());
+      Result = require(addToken(Self, PyTuple_GET_ITEM(T.get(), 0),
+                                PyTuple_GET_ITEM(T.get(), 1),
+                                PyTuple_GET_ITEM(T.get(), 2)));
       if (Result.get() == Py_True)
         break;
     }

@@ -42,9 +42,10 @@ int readInt(PyObject *O, const char *What) {
   return static_cast<int>(V);
 }
 
-/// A fast sequence (list or tuple) of O.
+/// A tuple of O's items: reading a grammar can run Python code (an item's
+/// __iter__, a label's __int__), which must not change what is being read.
 Ref sequence(PyObject *O, const char *What) {
-  PyObject *S = PySequence_Fast(O, "");
+  PyObject *S = PySequence_Tuple(O);
   if (!S) {
     PyErr_Clear();
     bad(std::string(What) + " is not a sequence");

@@ -169,6 +169,11 @@ TEST(PgenGrammar, RejectsMalformedSources) {
       {"token to symbol", [](GrammarSource &S) { S.Tokens.push_back({3, LExpr}); }},
       {"keyword label", [](GrammarSource &S) { S.Keywords.push_back({"if", LTerm}); }},
       {"start", [](GrammarSource &S) { S.Start = 300; }},
+      // First sets must be the ones the arcs give, or the driver would push
+      // symbols that cannot take the token and loop.
+      {"first set short", [](GrammarSource &S) { S.Dfas[1].First.pop_back(); }},
+      {"first set long", [](GrammarSource &S) { S.Dfas[2].First.push_back(LPlus); }},
+      {"left recursion", [](GrammarSource &S) { S.Dfas[3].States[0][0].Label = LExpr; }},
   };
   for (const Case &C : Cases) {
     GrammarSource S = tinySource();

@@ -239,6 +239,7 @@ Ref newArgInfo() {
 }
 
 Ref getDefiningArgInfoList(PyObject *Node) {
+  tl::NestingGuard Nesting("while listing parameters");
   Ref Current = Ref::borrow(Node);
   // parameters: '(' [typedargslist] ')'
   if (isNodeOf(Current.get(), C::CParametersNode)) {

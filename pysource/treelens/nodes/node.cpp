@@ -458,7 +458,8 @@ int initNodeTypes(PyObject *Module) {
     }
     PyTypeObject &Info = classInfoType();
     tl::registerPickle(cnodeType(),
-                       {{"fChildren", tl::FieldKind::Object, offsetof(NodeObject, Children), &PyList_Type},
+                       {{"fChildren", tl::FieldKind::Object, offsetof(NodeObject, Children), &PyList_Type,
+                         &cnodeType()},
                         {"fText", tl::FieldKind::Object, offsetof(NodeObject, Text), &PyString_Type},
                         {"fContext", tl::FieldKind::Object, offsetof(NodeObject, Context)},
                         {"fClsInfo", tl::FieldKind::Object, offsetof(NodeObject, ClsInfo), &Info},

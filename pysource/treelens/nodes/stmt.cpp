@@ -253,6 +253,7 @@ void appendNodeImportText(PyObject *Item, std::string &Out) {
     Out.append(PyString_AS_STRING(N->Text), PyString_GET_SIZE(N->Text));
     return;
   }
+  tl::NestingGuard Nesting("in _TextForImportName");
   if (Py_EnterRecursiveCall(" in _TextForImportName"))
     throw tl::PyErrSet();
   try {

@@ -82,6 +82,7 @@ bool isPlainStringByte(unsigned char B) {
 /// Runs Body one C recursion level deeper, so that a cyclic tree raises
 /// RuntimeError instead of overflowing the stack.
 template <class F> Ref nested(F &&Body) {
+  tl::NestingGuard Nesting("while rendering a node to text");
   if (Py_EnterRecursiveCall(" while rendering a node to text"))
     throw tl::PyErrSet();
   try {

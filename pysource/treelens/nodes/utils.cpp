@@ -38,8 +38,12 @@ Py_ssize_t getTokenEndIndex(PyObject *Node) noexcept {
     if (!isNode(Node))
       raiseCannotConvert(Node, cnodeType());
     Ref Current = Ref::borrow(Node);
-    while (nodeGetChildCount(node(Current.get())) != 0)
+    // A tree is at most MaxNativeNesting deep; a longer chain is a cycle.
+    for (int Steps = 0; nodeGetChildCount(node(Current.get())) != 0; ++Steps) {
+      if (Steps == tl::MaxNativeNesting)
+        tl::raise(PyExc_RuntimeError, "maximum recursion depth exceeded while finding the last token");
       Current = ref(childAt(node(Current.get()), -1));
+    }
     PyObject *Context = node(Current.get())->Context;
     if (!Context || (!PyInt_Check(Context) && !PyLong_Check(Context)))
       tl::raiseFormat(PyExc_TypeError, "unsupported operand type(s) for +: '%.100s' and 'int'",
@@ -115,7 +119,9 @@ bool isTupleExpression(PyObject *Atom) {
 
 Ref dropSimpleParens(PyObject *Node) {
   Ref Current = Ref::borrow(Node);
-  while (isNodeOf(Current.get(), C::CAtom)) {
+  for (int Steps = 0; isNodeOf(Current.get(), C::CAtom); ++Steps) {
+    if (Steps == tl::MaxNativeNesting)
+      tl::raise(PyExc_RuntimeError, "maximum recursion depth exceeded while dropping parentheses");
     NodeObject *N = node(Current.get());
     if (nodeGetChildCount(N) != 3 || !childTextIs(N, 0, "("))
       break;

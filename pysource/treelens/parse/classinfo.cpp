@@ -97,10 +97,21 @@ Py_ssize_t drainFreeList(ClassInfoObject *Info) {
   return Count;
 }
 
+// Unpickled links can form a cycle: Brent's algorithm finds one in time
+// linear in the list, with no memory.
 Py_ssize_t freeListLength(ClassInfoObject *Info) {
-  Py_ssize_t Count = 0;
-  for (NodeObject *N = Info->FirstFree; N; N = N->NextFree)
+  Py_ssize_t Count = 0, Power = 1, Lap = 0;
+  NodeObject *Mark = Info->FirstFree;
+  for (NodeObject *N = Info->FirstFree; N; N = N->NextFree) {
     ++Count;
+    if (Count > 1 && N == Mark)
+      tl::raiseFormat(PyExc_ValueError, "the free list of state %d is cyclic", Info->NodeType);
+    if (++Lap == Power) {
+      Mark = N;
+      Power *= 2;
+      Lap = 0;
+    }
+  }
   return Count;
 }
 

@@ -179,7 +179,7 @@ PyObject *factory_RecursiveConvert(PyObject *Self, PyObject *Raw) {
 }
 
 PyObject *factory_FreeNodeCount(PyObject *Self, PyObject *) {
-  return PyInt_FromSsize_t(factoryFreeNodeCount(self(Self)));
+  return tl::guard<PyObject *>(nullptr, [&] { return PyInt_FromSsize_t(factoryFreeNodeCount(self(Self))); });
 }
 
 PyMethodDef FactoryMethods[] = {
@@ -201,6 +201,12 @@ PyMethodDef FactoryMethods[] = {
 PyTypeObject &factoryType() { return FactoryType; }
 
 Ref newNode(ClassInfoObject *Info, PyObject *Value, PyObject *Context, PyObject *Children) {
+  // Node operations read these natively: a leaf's text is bytes, the
+  // children a list.
+  if (Value != Py_None)
+    tl::expectType(PyString_Check(Value), "bytes", Value);
+  if (Children != Py_None)
+    tl::expectType(PyList_Check(Children), "list", Children);
   NodeObject *N = Info->FirstFree;
   if (N) {
     // The record's reference to N passes to the caller; N keeps its own
@@ -243,21 +249,29 @@ Ref convertSingleNode(FactoryObject *F, int NodeType, PyObject *Value, PyObject 
       throw tl::PyErrSet();
     tl::raise(PyExc_AssertionError, "");
   }
-  ClassInfoObject *Info = nullptr;
   if (!F->ClassInfoList || !F->Keywords)
     tl::raise(PyExc_ValueError, "CNodeFactory is not initialised");
-  if (F->KeywordClassInfo &&
-      ((NodeType == kName && PyString_Check(Value) && PyDict_GetItem(F->Keywords, Value)) ||
-       NodeType == kAwait || NodeType == kAsync)) {
-    Info = F->KeywordClassInfo;
+  // The keyword lookup can run Python code (a str subclass's __hash__ or
+  // __eq__) that re-initialises F: the dict is held while it is searched and
+  // F's fields are read again after it.
+  bool Keyword = NodeType == kAwait || NodeType == kAsync;
+  if (!Keyword && NodeType == kName && F->KeywordClassInfo && PyString_Check(Value)) {
+    Ref Keywords = Ref::borrow(F->Keywords);
+    Keyword = PyDict_GetItem(Keywords.get(), Value) != nullptr;
+  }
+  Ref Info;
+  if (Keyword && F->KeywordClassInfo) {
+    Info = Ref::borrow(reinterpret_cast<PyObject *>(F->KeywordClassInfo));
   } else {
+    if (!F->ClassInfoList)
+      tl::raise(PyExc_ValueError, "CNodeFactory is not initialised");
     if (NodeType < 0 || NodeType >= PyList_GET_SIZE(F->ClassInfoList))
       tl::raise(PyExc_IndexError, "list index out of range");
     PyObject *I = PyList_GET_ITEM(F->ClassInfoList, NodeType);
     if (!PyObject_TypeCheck(I, &classInfoType()))
       tl::raiseFormat(PyExc_TypeError, "Cannot convert %.200s to %.200s", Py_TYPE(I)->tp_name,
                       classInfoType().tp_name);
-    Info = reinterpret_cast<ClassInfoObject *>(I);
+    Info = Ref::borrow(I);
   }
   // A simple statement's NEWLINE: keep the statement, recycle the NEWLINE leaf.
   if (Value == Py_None && Children != Py_None && PyList_Check(Children) && PyList_GET_SIZE(Children) == 2) {
@@ -271,9 +285,7 @@ Ref convertSingleNode(FactoryObject *F, int NodeType, PyObject *Value, PyObject 
       }
     }
   }
-  if (Value != Py_None)
-    tl::expectType(PyString_Check(Value), "bytes", Value);
-  return newNode(Info, Value, Context, Children);
+  return newNode(reinterpret_cast<ClassInfoObject *>(Info.get()), Value, Context, Children);
 }
 
 void discardNodes(PyObject *Node, int Depth) {
@@ -291,38 +303,51 @@ void discardNodes(PyObject *Node, int Depth) {
   pushFree(N);
   if (!N->Children)
     return;
-  PyObject *Kids = N->Children;
-  for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Kids); ++I)
-    discardNodes(PyList_GET_ITEM(Kids, I), Depth + 1);
+  // Releasing a stale free-list link can run Python code that changes the
+  // children: the list and each child are held while they are walked.
+  Ref Kids = Ref::borrow(N->Children);
+  for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Kids.get()); ++I) {
+    Ref Kid = Ref::borrow(PyList_GET_ITEM(Kids.get(), I));
+    discardNodes(Kid.get(), Depth + 1);
+  }
   Py_CLEAR(N->Children);
 }
 
 Ref recursiveConvert(FactoryObject *F, PyObject *Raw) {
-  Ref Seq = tl::require(PySequence_Fast(Raw, "raw node is not a sequence"));
-  Py_ssize_t N = PySequence_Fast_GET_SIZE(Seq.get());
+  tl::NestingGuard Nesting("while converting a raw tree");
+  // A tuple of the four items: converting runs Python code (int(), a
+  // converter's node class) that may change a list given as the raw node.
+  Ref Seq = tl::require(PySequence_Tuple(Raw));
+  Py_ssize_t N = PyTuple_GET_SIZE(Seq.get());
   if (N != 4)
     raiseUnpackCount(N, 4);
-  PyObject **Items = PySequence_Fast_ITEMS(Seq.get());
-  Ref TypeNumber = tl::require(PyNumber_Int(Items[0]));
+  PyObject *Type = PyTuple_GET_ITEM(Seq.get(), 0), *Value = PyTuple_GET_ITEM(Seq.get(), 1),
+           *Context = PyTuple_GET_ITEM(Seq.get(), 2), *Children = PyTuple_GET_ITEM(Seq.get(), 3);
+  Ref TypeNumber = tl::require(PyNumber_Int(Type));
   int NodeType = intArg(TypeNumber.get());
-  PyObject *Children = Items[3];
   if (Children == Py_None)
-    return convertSingleNode(F, NodeType, Items[1], Items[2], Py_None);
+    return convertSingleNode(F, NodeType, Value, Context, Py_None);
   tl::expectType(PyList_Check(Children), "list", Children);
   Ref Converted = tl::require(PyList_New(0));
   for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Children); ++I) {
-    PyObject *Child = PyList_GET_ITEM(Children, I);
-    tl::expectType(PyTuple_Check(Child), "tuple", Child);
-    tl::requireStatus(PyList_Append(Converted.get(), recursiveConvert(F, Child).get()));
+    Ref Child = Ref::borrow(PyList_GET_ITEM(Children, I));
+    tl::expectType(PyTuple_Check(Child.get()), "tuple", Child.get());
+    tl::requireStatus(PyList_Append(Converted.get(), recursiveConvert(F, Child.get()).get()));
   }
-  return convertSingleNode(F, NodeType, Items[1], Items[2], Converted.get());
+  return convertSingleNode(F, NodeType, Value, Context, Converted.get());
 }
 
 Py_ssize_t factoryFreeNodeCount(FactoryObject *F) {
   Py_ssize_t Count = 0;
   if (F->ClassInfoList)
-    for (Py_ssize_t I = 0; I < PyList_GET_SIZE(F->ClassInfoList); ++I)
-      Count += freeListLength(reinterpret_cast<ClassInfoObject *>(PyList_GET_ITEM(F->ClassInfoList, I)));
+    for (Py_ssize_t I = 0; I < PyList_GET_SIZE(F->ClassInfoList); ++I) {
+      // The list is reachable from Python (through pickling): check each item.
+      PyObject *Info = PyList_GET_ITEM(F->ClassInfoList, I);
+      if (!PyObject_TypeCheck(Info, &classInfoType()))
+        tl::raiseFormat(PyExc_TypeError, "Cannot convert %.200s to %.200s", Py_TYPE(Info)->tp_name,
+                        classInfoType().tp_name);
+      Count += freeListLength(reinterpret_cast<ClassInfoObject *>(Info));
+    }
   if (F->KeywordClassInfo)
     Count += freeListLength(F->KeywordClassInfo);
   return Count;
@@ -346,7 +371,7 @@ int initFactoryType(PyObject *Module) {
     tl::requireStatus(tl::addType(Module, "CNodeFactory", FactoryType));
     tl::registerPickle(FactoryType,
                        {{"_fClassInfoList", tl::FieldKind::Object, offsetof(FactoryObject, ClassInfoList),
-                         &PyList_Type},
+                         &PyList_Type, &classInfoType()},
                         {"_fKeywordClassInfo", tl::FieldKind::Object,
                          offsetof(FactoryObject, KeywordClassInfo), &classInfoType()},
                         {"_fKeywords", tl::FieldKind::Object, offsetof(FactoryObject, Keywords), &PyDict_Type}},

@@ -80,6 +80,7 @@ struct ParserObject {
   bool AsyncAlwaysKeyword;
   // Bound engine methods, used when the engine publishes no native API.
   PyObject *SetupMethod, *AddTokenMethod, *GetRootNodeMethod;
+  bool Busy; ///< a parse is in progress: no re-entry, no re-initialisation
 };
 
 TL_HIDDEN PyTypeObject &parserType();

@@ -6,6 +6,7 @@
 #include "pysource/treelens/host/host.h"
 
 #include <cstring>
+#include <memory>
 
 namespace treelens {
 
@@ -17,6 +18,15 @@ namespace {
 PyTypeObject ParserType;
 
 ParserObject *self(PyObject *O) { return reinterpret_cast<ParserObject *>(O); }
+
+constexpr const char *kBusyMessage = "CPGenParserImpl is busy: it may not be re-entered or re-initialised "
+                                     "while it parses";
+
+/// Refuses to change a parser while it parses (its __init__, __setstate__).
+void requireIdle(PyObject *O) {
+  if (self(O)->Busy)
+    tl::raise(PyExc_RuntimeError, kBusyMessage);
+}
 
 /// A token the parser feeds of its own accord, with its type as the host classifies it.
 struct SynthToken {
@@ -93,12 +103,13 @@ void addSynth(ParserObject *P, std::initializer_list<const SynthToken *> Tokens,
 void addTokenList(ParserObject *P, PyObject *TokenList, PyObject *Context) {
   Ref Seq = tl::require(PySequence_Fast(TokenList, "token list must be a sequence"));
   for (Py_ssize_t I = 0; I < PySequence_Fast_GET_SIZE(Seq.get()); ++I) {
-    PyObject *Text = PySequence_Fast_GET_ITEM(Seq.get(), I);
-    tl::expectType(PyString_Check(Text), "bytes", Text);
-    int Type = Host.Fast->TokenTypeOfText(PyString_AS_STRING(Text), PyString_GET_SIZE(Text));
+    // Held: feeding it may run Python code that changes the list.
+    Ref Text = Ref::borrow(PySequence_Fast_GET_ITEM(Seq.get(), I));
+    tl::expectType(PyString_Check(Text.get()), "bytes", Text.get());
+    int Type = Host.Fast->TokenTypeOfText(PyString_AS_STRING(Text.get()), PyString_GET_SIZE(Text.get()));
     if (Type < 0)
       throw tl::PyErrSet();
-    engineAddToken(P, Type, Text, Context);
+    engineAddToken(P, Type, Text.get(), Context);
   }
 }
 
@@ -117,40 +128,107 @@ bool shouldSkipSlash(ParserObject *P, Py_ssize_t TokI) {
   return L->Positions[TokI + 1].Row > L->Positions[TokI].Row;
 }
 
-/// The tokens of a logical-line record.
-struct LogicalSource {
-  host::LogicalLineObject *L;
-  Py_ssize_t count() const { return L->TokenCount; }
-  PyObject *text(Py_ssize_t I) const {
-    PyObject *T = L->Texts[I] ? L->Texts[I] : Py_None;
-    tl::expectType(PyString_Check(T), "bytes", T);
-    return T;
+/// The tokens of one parse, read before any Python code can run (a token's
+/// __hash__ or __eq__, a converter, a finaliser may re-initialise the record
+/// or empty the list): the texts, held, their types, and whether a backslash
+/// is a line continuation the parser skips.
+class TokenSnapshot {
+public:
+  struct Token {
+    PyObject *Text; ///< owned bytes
+    int Type;
+    bool Continuation;
+  };
+
+  TokenSnapshot() = default;
+  TokenSnapshot(const TokenSnapshot &) = delete;
+  TokenSnapshot &operator=(const TokenSnapshot &) = delete;
+  ~TokenSnapshot() {
+    for (Py_ssize_t I = 0; I < Count; ++I)
+      Py_DECREF(Toks[I].Text);
   }
-  int type(Py_ssize_t I, PyObject *) const { return L->Types[I]; }
-  PyObject *nextKept(Py_ssize_t I) const { return host::nextNonRemovedTokenInLogical(L, I); }
-  bool skipSlash(ParserObject *P, Py_ssize_t I) const { return shouldSkipSlash(P, I); }
-  bool isTry() const { return L->Kind == 11; }
+
+  /// The tokens of a logical-line record.
+  void readLogical(host::LogicalLineObject *L) {
+    const Py_ssize_t N = L->TokenCount;
+    reserve(N);
+    for (Py_ssize_t I = 0; I < N; ++I) {
+      PyObject *T = L->Texts[I] ? L->Texts[I] : Py_None;
+      tl::expectType(PyString_Check(T), "bytes", T);
+      // A backslash continues the line when it ends its physical line.
+      bool Continuation = PyString_GET_SIZE(T) == 1 && PyString_AS_STRING(T)[0] == '\\' &&
+                          (I == N - 1 || L->Positions[I + 1].Row > L->Positions[I].Row);
+      add(T, L->Types[I], Continuation);
+    }
+    IsTry = L->Kind == 11;
+  }
+
+  /// A plain list of token texts. A backslash in a list is always a line
+  /// continuation: a list has no positions to tell otherwise.
+  void readList(PyObject *List) {
+    const Py_ssize_t N = PyList_GET_SIZE(List);
+    reserve(N);
+    for (Py_ssize_t I = 0; I < N; ++I) {
+      PyObject *T = PyList_GET_ITEM(List, I);
+      tl::expectType(PyString_Check(T), "bytes", T);
+      int Type = Host.Fast->TokenTypeOfText(PyString_AS_STRING(T), PyString_GET_SIZE(T));
+      if (Type < 0)
+        throw tl::PyErrSet();
+      add(T, Type, true);
+    }
+    IsTry = N > 0 && textIs(Toks[0].Text, Synth.Try.Text);
+  }
+
+  Py_ssize_t count() const { return Count; }
+  const Token &operator[](Py_ssize_t I) const { return Toks[I]; }
+  bool isTry() const { return IsTry; }
+
+  /// Borrowed text of the first token after I that is no comment or
+  /// backslash, or nullptr.
+  PyObject *nextKept(Py_ssize_t I) const {
+    for (Py_ssize_t J = I + 1; J < Count; ++J) {
+      PyObject *T = Toks[J].Text;
+      if (PyString_GET_SIZE(T) == 0 || (PyString_AS_STRING(T)[0] != '\\' && PyString_AS_STRING(T)[0] != '#'))
+        return T;
+    }
+    return nullptr;
+  }
+
+private:
+  static constexpr Py_ssize_t InlineSize = 64;
+
+  void reserve(Py_ssize_t N) {
+    if (N > InlineSize) {
+      Heap.reset(new Token[static_cast<size_t>(N)]);
+      Toks = Heap.get();
+    }
+  }
+  void add(PyObject *Text, int Type, bool Continuation) {
+    Py_INCREF(Text);
+    Toks[Count++] = Token{Text, Type, Continuation};
+  }
+
+  Token Inline[InlineSize];
+  std::unique_ptr<Token[]> Heap;
+  Token *Toks = Inline;
+  Py_ssize_t Count = 0; ///< Toks[0, Count) are filled
+  bool IsTry = false;
 };
 
-/// A plain list of token texts. A backslash in a list is always a line
-/// continuation: a list has no positions to tell otherwise.
-struct ListSource {
-  PyObject *List;
-  Py_ssize_t count() const { return PyList_GET_SIZE(List); }
-  PyObject *text(Py_ssize_t I) const {
-    PyObject *T = PyList_GET_ITEM(List, I);
-    tl::expectType(PyString_Check(T), "bytes", T);
-    return T;
+/// Marks a parser busy for one parse and keeps it alive meanwhile: Python code
+/// run by the parse may drop the last other reference to it.
+class ParseScope {
+public:
+  explicit ParseScope(ParserObject *P) : P(P), Hold(Ref::borrow(reinterpret_cast<PyObject *>(P))) {
+    if (P->Busy)
+      tl::raise(PyExc_RuntimeError, kBusyMessage);
+    P->Busy = true;
   }
-  int type(Py_ssize_t, PyObject *Text) const {
-    int T = Host.Fast->TokenTypeOfText(PyString_AS_STRING(Text), PyString_GET_SIZE(Text));
-    if (T < 0)
-      throw tl::PyErrSet();
-    return T;
-  }
-  PyObject *nextKept(Py_ssize_t I) const { return host::nextNonRemovedTokenInList(List, I); }
-  bool skipSlash(ParserObject *, Py_ssize_t) const { return true; }
-  bool isTry() const { return count() > 0 && textIs(text(0), Synth.Try.Text); }
+  ~ParseScope() { P->Busy = false; }
+
+private:
+  ParserObject *P;
+  Ref Hold;
 };
 
 /// Pops and returns item 0 of a node's children. New reference.
@@ -190,14 +268,14 @@ Ref takeStatement(ParserObject *P, Ref Root, bool Decorator) {
   return Decorators;
 }
 
-template <class Source> Ref parseTokens(ParserObject *P, const Source &S, bool AsyncKw) {
+Ref parseTokens(ParserObject *P, const TokenSnapshot &S, bool AsyncKw) {
   engineSetup(P, P->FileInputNumber);
   bool First = true, Decorator = false;
   int LastType = -1;
   Py_ssize_t Count = S.count();
   for (Py_ssize_t I = 0; I < Count; ++I) {
-    PyObject *Tok = S.text(I);
-    int TokType = S.type(I, Tok);
+    PyObject *Tok = S[I].Text;
+    int TokType = S[I].Type;
     Ref Context = tl::require(PyInt_FromSsize_t(I));
     if (First && TokType == kName) {
       // Clauses that continue a compound statement get a synthetic head.
@@ -227,7 +305,7 @@ template <class Source> Ref parseTokens(ParserObject *P, const Source &S, bool A
     }
     if (TokType == kComment)
       continue;
-    if (TokType == kBackslash && S.skipSlash(P, I))
+    if (TokType == kBackslash && S[I].Continuation)
       continue;
     if (TokType == kEllipsis && !P->Py3Grammar) {
       addSynth(P, {&Synth.Dot, &Synth.Dot, &Synth.Dot}, Context.get());
@@ -262,6 +340,8 @@ PyObject *parserConvert(PyObject *Converter, PyObject *, int NodeType, PyObject 
   return tl::guard<PyObject *>(nullptr, [&] {
     ParserObject *P = self(Converter);
     requireReady(P);
+    // Held: converting may run Python code that re-initialises P.
+    Ref Factory = Ref::borrow(reinterpret_cast<PyObject *>(P->Factory));
     return convertSingleNode(P->Factory, NodeType, Value, Context, Children).release();
   });
 }
@@ -342,6 +422,7 @@ int parser_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
     if (!PyArg_ParseTupleAndKeywords(Args, Kwds, "O|OOO:CPGenParserImpl", const_cast<char **>(Keywords),
                                      &VersionTriple, &GrammarFile, &KeywordSeq, &Py3Grammar))
       throw tl::PyErrSet();
+    requireIdle(Self);
     tl::expectType(PyTuple_Check(VersionTriple), "tuple", VersionTriple);
     ParserObject *P = self(Self);
     Ref Grammar = GrammarFile ? Ref::borrow(GrammarFile)
@@ -600,18 +681,24 @@ void addClsForState() {
 PyTypeObject &parserType() { return ParserType; }
 
 Ref parseToNode(ParserObject *P, PyObject *Logical, bool InAsyncDef) {
+  ParseScope Scope(P);
   requireReady(P);
   auto *L = host::requireLogicalArg(Logical, "logical");
+  TokenSnapshot S;
+  S.readLogical(L);
   Py_INCREF(Logical);
   Py_XSETREF(P->Logical, Logical);
-  return parseTokens(P, LogicalSource{L}, P->AsyncAlwaysKeyword || InAsyncDef);
+  return parseTokens(P, S, P->AsyncAlwaysKeyword || InAsyncDef);
 }
 
 Ref parseTokenListToNode(ParserObject *P, PyObject *TokList, bool InAsyncDef) {
+  ParseScope Scope(P);
   requireReady(P);
   tl::expectType(PyList_Check(TokList), "list", TokList);
+  TokenSnapshot S;
+  S.readList(TokList);
   Py_CLEAR(P->Logical);
-  return parseTokens(P, ListSource{TokList}, InAsyncDef);
+  return parseTokens(P, S, InAsyncDef);
 }
 
 int initParserType(PyObject *Module) {
@@ -664,7 +751,7 @@ int initParserType(PyObject *Module) {
                         {"__CLogicalLine", F::Object, offsetof(ParserObject, CLogicalLine)},
                         {"_fVersionTriple", F::Object, offsetof(ParserObject, VersionTriple), &PyTuple_Type},
                         {"_fAsyncAlwaysKeyword", F::Bool, offsetof(ParserObject, AsyncAlwaysKeyword)}},
-                       Host.UnpickleFields);
+                       Host.UnpickleFields, requireIdle);
     return 0;
   });
 }
