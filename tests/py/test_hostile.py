@@ -359,10 +359,11 @@ class _World(object):
         self.targets = [fa, tl, optpgen]
 
     def _Collect(self, node):
-        stack = [node]
-        while stack:
+        stack, seen = [node], set()  # trees made from crafted children may be cyclic
+        while stack and len(self.nodes) < 400:
             n = stack.pop()
-            if isinstance(n, tl.CNode):
+            if isinstance(n, tl.CNode) and id(n) not in seen:
+                seen.add(id(n))
                 self.nodes.append(n)
                 stack.extend(n.fChildren or [])
 
