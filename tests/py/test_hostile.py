@@ -357,6 +357,9 @@ class _World(object):
                         cycle, {}, {1: 2}, (), (1, b'x', 0, None), (300, None, 0, [(1, b'x', 0, None)] * 2),
                         object(), tl.CNode, tl.CAtom, type, len]
         self.targets = [fa, tl, optpgen]
+        # Walkers: the analyzer's own, fresh ones, and one whose handler makes mischief mid-walk.
+        self.walkers = [self.analyzers[0]._fNodeWalker, tl.CNodeWalker(), self.analyzers[1]._fTypeHintWalker,
+                        tl.CDispatchWalker({tl.CNameLiteral: lambda w, n: self.Mischief() or True})]
 
     def _Collect(self, node):
         stack, seen = [node], set()  # trees made from crafted children may be cyclic
@@ -477,7 +480,7 @@ class _World(object):
     def Call(self, log):
         rnd = self.rnd
         kinds = [self.analyzers, self.parsers, self.factories, self.infos, self.records, self.nodes,
-                 self.engines, self.targets, self.targets]
+                 self.engines, self.walkers, self.targets, self.targets]
         target = rnd.choice(rnd.choice(kinds))
         names = _NativeCallables(target)
         if not names:
