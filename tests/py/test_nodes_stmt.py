@@ -60,9 +60,16 @@ def Text(node):
 
 
 def Make(cls, children=None, text=None, context=0, name=b'made'):
-    """A node of class cls with the given fields, as the factory would fill them."""
+    """A node of class cls with the given fields, as the factory would fill them.
+
+    Children that are not nodes (which a node refuses to be given) are put
+    into its children list afterwards, as a careless caller could.
+    """
     node = cls(tl.CNodeClassInfo(cls, 300, name))
-    node.__setstate__((children, node.fClsInfo, context, None, text))
+    valid = None if children is None else [c for c in children if isinstance(c, tl.CNode)]
+    node.__setstate__((valid, node.fClsInfo, context, None, text))
+    if children is not None and len(valid) != len(children):
+        node.fChildren[:] = children
     return node
 
 
