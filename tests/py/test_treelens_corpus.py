@@ -102,16 +102,28 @@ def Disagreements(rec, facts):
     return out
 
 
-def JudgeByAst(path, logicals, facts_of, wrong):
-    """Checks each analyzed logical against the ast facts of its completed source.
+class AstJudge(object):
+    """Checks analyzed logicals against the ast facts of their completed sources, in batches.
 
-    facts_of maps a list of completed sources to their facts (None where CPython cannot parse).
+    facts_of maps a list of completed sources to their facts (None where CPython cannot parse);
+    disagreements are appended to `wrong`.
     """
-    recs = [(l.fFirstLine + 1, l.fLineText[:120], Recorded(l)) for l in logicals]
-    facts = facts_of([CompletedSource(l) for l in logicals])
-    for (line, text, rec), fact in zip(recs, facts):
-        if fact is not None:
-            wrong.extend('%s:%d: %r: %s' % (path, line, text, d) for d in Disagreements(rec, fact))
+
+    def __init__(self, facts_of, wrong, batch=1):
+        self.facts_of, self.wrong, self.batch, self.pending = facts_of, wrong, batch, []
+
+    def Add(self, path, logicals):
+        self.pending.extend(((path, l.fFirstLine + 1, l.fLineText[:120], Recorded(l)), CompletedSource(l))
+                            for l in logicals)
+        if len(self.pending) >= self.batch:
+            self.Flush()
+
+    def Flush(self):
+        pending, self.pending = self.pending, []
+        facts = self.facts_of([src for _, src in pending]) if pending else []
+        for ((path, line, text, rec), _), fact in zip(pending, facts):
+            if fact is not None:
+                self.wrong.extend('%s:%d: %r: %s' % (path, line, text, d) for d in Disagreements(rec, fact))
 
 
 def Facts36(sources):
@@ -165,6 +177,7 @@ class Corpus27Test(unittest.TestCase):
         analyzer = analysis.GetAnalyzer('2.7')
         files = support.CorpusFiles('2.7')
         wrong, judged, print_function_files, rejected_files, counts = [], [], 0, 0, []
+        judge = AstJudge(lambda sources: [astfacts.Facts(src) for src in sources], judged)
         for path in files:
             text = support.ReadBytes(path)
             logicals = GetLogicalsFromText(text)
@@ -173,7 +186,7 @@ class Corpus27Test(unittest.TestCase):
             analyzed = []
             failed = Analyze(analyzer.ImplFor(logicals), text, False, counts, analyzed)
             if not uses_print_function:  # ast.parse has no print_function flag here
-                JudgeByAst(path, analyzed, lambda srcs: [astfacts.Facts(s) for s in srcs], judged)
+                judge.Add(path, analyzed)
             if Compiles27(text):
                 wrong.extend(Describe(path, l, r) for l, r in failed)
                 continue
@@ -197,6 +210,7 @@ class Corpus36Test(unittest.TestCase):
         texts = [(path, support.ReadBytes(path)) for path in files]
         compiling = OracleCompiles('3.6', texts)
         wrong, judged, suspects, counts = [], [], [], []
+        judge = AstJudge(Facts36, judged, batch=40000)  # one 3.6 process per 40,000 lines
         for path, text in texts:
             analyzed = []
             for logical, result in Analyze(analyzer, text, True, counts, analyzed):
@@ -204,7 +218,8 @@ class Corpus36Test(unittest.TestCase):
                     wrong.append(Describe(path, logical, result))
                 else:
                     suspects.append((len(suspects), (path, logical, result)))
-            JudgeByAst(path, analyzed, Facts36, judged)
+            judge.Add(path, analyzed)
+        judge.Flush()
         accepted = OracleCompiles('3.6', [(i, CompletedSource(l)) for i, (_, l, _) in suspects])
         wrong.extend(Describe(*item) for i, item in suspects if i in accepted)
         sys.stderr.write('\n3.6 corpus: %d files (%d rejected by CPython), %d logical lines, %d disagree, '
