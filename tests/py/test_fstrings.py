@@ -221,6 +221,8 @@ class InspectionTest(unittest.TestCase):
             self.assertIn(name, reads)
         self.assertEqual(reads.count(b'd'), 1)  # the nested field is analyzed once
         self.assertIn(b'x', logical.fNamesDefined)
+        # A binding within the comprehension names the f-string token (index 2) that holds it.
+        self.assertIn((b'i', symbolinfo.kWithinExprPrefix + b'2'), logical.fTypeEquivs)
 
     def testNoLeaks(self):
         analyzer = tl.CPGenAnalyzerImpl((3, 6, 0))

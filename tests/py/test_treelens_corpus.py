@@ -57,6 +57,7 @@ def Analyze(analyzer, text, async_scopes, counts, analyzed=None):
 
 kWord = re.compile(br'[A-Za-z_][A-Za-z_0-9]*')
 kQuoted = re.compile(br"'[^']*'")  # an encoded string literal in a rendered name
+kFString = re.compile(br"""[rR]?[fF][rR]?['"]""")
 
 
 def Recorded(logical):
@@ -87,7 +88,8 @@ def Disagreements(rec, facts):
     out.extend('reads absent %s' % n for n in rec['reads'] if any(w not in line for w in kWord.findall(kQuoted.sub(b'', n))))
     for name, info in rec['within']:
         i = int(info[len(si.kWithinExprPrefix):])
-        if not (0 <= i < len(tokens) and tokens[i] == name.split(b'.')[-1]):
+        last = name.split(b'.')[-1]  # inside an f-string: the f-string token that holds it
+        if not (0 <= i < len(tokens) and (tokens[i] == last or (kFString.match(tokens[i]) and last in tokens[i]))):
             out.append('within %s at %d' % (name, i))
     bound_within = set(n for n, _ in rec['within'])
     out.extend('no within %s' % n for n in utf8(facts['within']) if n not in bound_within)

@@ -36,14 +36,39 @@ Ref snapshot(PyObject *List) {
   return tl::require(PyList_GetSlice(List, 0, PY_SSIZE_T_MAX));
 }
 
-/// Appends Sub's type equivalences and names defined to Logical.
-void copyFindings(PyObject *Logical, PyObject *Sub) {
+/// Whether Info is a binding within a sub-expression: its prefix, then a token index.
+bool isWithinExprInfo(PyObject *Info) {
+  PyObject *Prefix = host::sym(host::Sym::kWithinExprPrefix);
+  if (!PyString_Check(Info) || !PyString_Check(Prefix))
+    return false;
+  Py_ssize_t N = PyString_GET_SIZE(Info), P = PyString_GET_SIZE(Prefix);
+  const char *S = PyString_AS_STRING(Info);
+  if (N <= P || std::memcmp(S, PyString_AS_STRING(Prefix), P) != 0)
+    return false;
+  for (Py_ssize_t I = P; I < N; ++I)
+    if (S[I] < '0' || S[I] > '9')
+      return false;
+  return true;
+}
+
+/// Appends Sub's type equivalences and names defined to Logical. A binding
+/// within a sub-expression names a token of Sub; on Logical it names the
+/// f-string token TokenI that holds it.
+void copyFindings(PyObject *Logical, PyObject *Sub, Py_ssize_t TokenI) {
   Ref Equivs = snapshot(record(Sub)->TypeEquivs);
   Ref Defined = snapshot(record(Sub)->NamesDefined);
+  Ref Within;
   for (Py_ssize_t I = 0; Equivs && I < PyList_GET_SIZE(Equivs.get()); ++I) {
     PyObject *Pair = PyList_GET_ITEM(Equivs.get(), I);
     tl::expectType(PyTuple_Check(Pair) && PyTuple_GET_SIZE(Pair) == 2, "tuple", Pair);
-    tl::requireStatus(Host.Fast->AppendTypeEquiv(Logical, PyTuple_GET_ITEM(Pair, 0), PyTuple_GET_ITEM(Pair, 1)));
+    PyObject *Info = PyTuple_GET_ITEM(Pair, 1);
+    if (isWithinExprInfo(Info)) {
+      if (!Within)
+        Within = tl::require(PyString_FromFormat("%s%zd", PyString_AS_STRING(host::sym(host::Sym::kWithinExprPrefix)),
+                                                 TokenI));
+      Info = Within.get();
+    }
+    tl::requireStatus(Host.Fast->AppendTypeEquiv(Logical, PyTuple_GET_ITEM(Pair, 0), Info));
   }
   for (Py_ssize_t I = 0; Defined && I < PyList_GET_SIZE(Defined.get()); ++I) {
     PyObject *Name = PyList_GET_ITEM(Defined.get(), I);
@@ -208,7 +233,7 @@ void inspectSingleFStringToken(AnalyzerObject *A, PyObject *Logical, Py_ssize_t 
         raiseLocated(Logical, TokenI, Text, It.Pos, Sub, parseErrorContext());
       throw tl::PyErrSet();
     }
-    copyFindings(Logical, Sub);
+    copyFindings(Logical, Sub, TokenI);
   }
 }
 
