@@ -2,11 +2,15 @@
 
 Both sides run in this process over the same logical lines, split beforehand
 with GetLogicalsFromText. treelens runs CPGenAnalyzerImpl.AnalyzeSingleLogical
-with the 2.7 grammar on every logical line (parse, walk, discard). The peer is
-CPython 2.7's compile(..., ast.PyCF_ONLY_AST) on the source text of the same
-lines, completed the way the analyzer completes them (a block header gets a
-"pass" body, a lone else/elif/except/finally its opening clause, a decorator
-its function). Prints microseconds per logical line for both and their ratio.
+with the 2.7 grammar on every logical line (parse, walk, record, discard), and,
+for comparison, the parse alone (ParseToNode and DiscardNode of a parser of the
+same grammar). The peers are CPython 2.7's compile(..., ast.PyCF_ONLY_AST) on
+the source text of the same lines, completed the way the analyzer completes
+them (a block header gets a "pass" body, a lone else/elif/except/finally its
+opening clause, a decorator its function), and that compile followed by an
+ast.walk that collects the names read and bound, which is what a Python user
+would write to get the same facts. Prints microseconds per logical line for
+each and the ratios.
 
 A second pass renders every expression node of the same lines to text with
 the walker's converter (all three options true) and prints nanoseconds per
@@ -79,6 +83,46 @@ def TimeTreelens(analyzer, logicals, repeat):
         start = time.time()
         for logical in logicals:
             analyze(logical, False)
+        elapsed = time.time() - start
+        best = elapsed if best is None else min(best, elapsed)
+    return best
+
+
+def TimeParseOnly(logicals, repeat):
+    parser = treelens.CPGenParserImpl((2, 7, 0), treelens.kPy2DefaultGrammar, None, False)
+    parse, discard = parser.ParseToNode, parser.DiscardNode
+    best = None
+    for _ in range(repeat):
+        gc.collect()
+        start = time.time()
+        for logical in logicals:
+            try:
+                tree = parse(logical, False)
+            except Exception:
+                continue
+            if tree is not None:
+                discard(tree)
+        elapsed = time.time() - start
+        best = elapsed if best is None else min(best, elapsed)
+    return best
+
+
+def TimeCPythonWalk(sources, repeat):
+    """compile to an AST, then ast.walk collecting the names read and bound."""
+    best = None
+    flags, Name, Load, walk = ast.PyCF_ONLY_AST, ast.Name, ast.Load, ast.walk
+    for _ in range(repeat):
+        gc.collect()
+        start = time.time()
+        for src in sources:
+            try:
+                tree = compile(src, '<s>', 'exec', flags)
+            except (SyntaxError, ValueError, TypeError):
+                continue
+            reads, binds = set(), set()
+            for node in walk(tree):
+                if isinstance(node, Name):
+                    (reads if isinstance(node.ctx, Load) else binds).add(node.id)
         elapsed = time.time() - start
         best = elapsed if best is None else min(best, elapsed)
     return best
@@ -170,11 +214,17 @@ def main():
     analyzer = treelens.CPGenAnalyzerImpl((2, 7, 0), treelens.kPy2DefaultGrammar, None, False)
     n = len(logicals)
     ours = TimeTreelens(analyzer, logicals, repeat)
+    parse_only = TimeParseOnly(logicals, repeat)
     peer = TimeCPython(sources, repeat)
+    peer_walk = TimeCPythonWalk(sources, repeat)
     print('logical lines: %d (best of %d runs)' % (n, repeat))
-    print('treelens AnalyzeSingleLogical: %7.3f us/line' % (ours * 1e6 / n))
+    print('treelens AnalyzeSingleLogical (full analysis): %7.3f us/line' % (ours * 1e6 / n))
+    print('treelens parse only (ParseToNode + DiscardNode): %7.3f us/line' % (parse_only * 1e6 / n))
     print('CPython compile(PyCF_ONLY_AST): %7.3f us/line' % (peer * 1e6 / n))
-    print('ratio treelens / CPython: %.3f' % (ours / peer))
+    print('CPython compile + ast.walk of names: %7.3f us/line' % (peer_walk * 1e6 / n))
+    print('ratio full analysis / parse only: %.3f' % (ours / parse_only))
+    print('ratio full analysis / CPython compile: %.3f' % (ours / peer))
+    print('ratio full analysis / CPython compile + walk: %.3f' % (ours / peer_walk))
     render_repeat = int(sys.argv[3]) if len(sys.argv) > 3 else 1
     ours, peer, nodes = TimeRendering(logicals, render_repeat)
     print('expression nodes: %d (best of %d runs)' % (nodes, render_repeat))

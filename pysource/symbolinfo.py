@@ -136,7 +136,7 @@ _kEscape = dict((chr(i), chr(i) if chr(i) in _kBodySafe or i >= 0x80
                  else '%%%02X' % i) for i in range(256))
 
 
-def EncodeStringLiteral(text):
+def _EncodeStringLiteralPy(text):
     """Compact, unambiguous form of a string literal token, for info strings.
 
     The result is the literal's prefix letters, lower-cased and in the order
@@ -376,9 +376,9 @@ def _JoinTokensPy(texts):
 
 
 try:
-    from pysource._fastaccess import JoinTokens
+    from pysource._fastaccess import JoinTokens, EncodeStringLiteral
 except ImportError:
-    JoinTokens = _JoinTokensPy
+    JoinTokens, EncodeStringLiteral = _JoinTokensPy, _EncodeStringLiteralPy
 
 
 # -- Value classes -------------------------------------------------------------

@@ -1,6 +1,7 @@
 // Module pysource._fastaccess: record operations, tokenizer functions and the native API capsule.
 #include "pysource/_fastaccess/internal.h"
 #include "pysource/_fastaccess/jointokens.h"
+#include "pysource/_fastaccess/literals.h"
 #include "pysource/_fastaccess/records.h"
 
 #include "typedesc.h"
@@ -109,6 +110,9 @@ PyObject *f_clear_free_list(PyObject *, PyObject *) {
 }
 
 PyMethodDef Functions[] = {
+    {"EncodeStringLiteral", f_encode_string_literal, METH_O,
+     "EncodeStringLiteral(text) -> bytes: the compact form of a string literal token (see symbolinfo)."},
+
     {"ClearLogicalDerivedInfo", f_clear, METH_O,
      "ClearLogicalDerivedInfo(logical): empties the derived-info lists."},
     {"AppendLogicalAttrib", f_append_attrib, METH_VARARGS,

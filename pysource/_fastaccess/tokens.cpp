@@ -148,6 +148,7 @@ public:
       if (!S.Text) {
         Ref New = tokenText(Text, Len, Kind);
         S = {H, Ref::borrow(New.get()).release()};
+        Filled.push_back(I);
         ++Used;
         return New;
       }
@@ -157,10 +158,12 @@ public:
     }
   }
 
-  /// Drops the shared texts; keeps a modest table for the next split.
+  /// Drops the shared texts; keeps a modest table for the next split. Costs
+  /// the texts held, not the table size: a short split follows a long one.
   void clear() {
-    for (Slot &S : Slots)
-      Py_CLEAR(S.Text);
+    for (size_t I : Filled)
+      Py_CLEAR(Slots[I].Text);
+    Filled.clear();
     if (Slots.size() > kKeepSlots)
       std::vector<Slot>().swap(Slots);
     Used = 0;
@@ -195,6 +198,7 @@ private:
     Old.swap(Slots);
     Slots.assign(Old.empty() ? 1024 : Old.size() * 2, Slot{0, nullptr});
     size_t Mask = Slots.size() - 1;
+    Filled.clear();
     for (const Slot &S : Old) {
       if (!S.Text)
         continue;
@@ -202,10 +206,12 @@ private:
       while (Slots[I].Text)
         I = (I + 1) & Mask;
       Slots[I] = S;
+      Filled.push_back(I);
     }
   }
 
   std::vector<Slot> Slots;
+  std::vector<size_t> Filled; ///< indices of the slots that hold a text
   size_t Used = 0;
 };
 

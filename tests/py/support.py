@@ -92,3 +92,16 @@ def RunOracle(version, script, stdin_data=None):
     if proc.returncode != 0:
         raise AssertionError('oracle %s failed: %s' % (version, err[-2000:]))
     return out
+
+
+def Analyzer(version):
+    """The shared CPGenAnalyzerImpl of a language version ('2.7', '3.5', '3.6'), as the API makes it."""
+    from pysource import analysis
+    return analysis.GetAnalyzer(version).Impl()
+
+
+def AnalyzeLine(version, source, in_async_def=False):
+    """(result, logical) of the first logical line of source analyzed under version."""
+    from pysource import utils
+    logical = utils.GetLogicalsFromText(source)[0]
+    return Analyzer(version).AnalyzeSingleLogical(logical, in_async_def), logical

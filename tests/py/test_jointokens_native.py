@@ -65,6 +65,7 @@ class NativeIsUsedTest(unittest.TestCase):
 
     def testSymbolinfoUsesTheNativeFunction(self):
         self.assertIs(_fastaccess.JoinTokens, si.JoinTokens)
+        self.assertIs(_fastaccess.EncodeStringLiteral, si.EncodeStringLiteral)
 
 
 class CorpusTest(unittest.TestCase):
@@ -79,6 +80,8 @@ class CorpusTest(unittest.TestCase):
         for path in files:
             for toks in _LogicalTokens(path):
                 lines += 1
+                for tok in toks:  # the native EncodeStringLiteral, on every token
+                    self.assertEqual(si._EncodeStringLiteralPy(tok), _fastaccess.EncodeStringLiteral(tok), tok)
                 expected = ref(toks)
                 self.assertEqual(expected, native(toks), '%s: %r' % (path, toks))
                 seed = rnd.random()
@@ -119,6 +122,8 @@ class FuzzTest(unittest.TestCase):
         rounds = 4000 if support.kSanitized else 40000
         for n in range(rounds):
             texts = [_RandomText(rnd) for _ in range(rnd.randint(0, 8))]
+            literal = b''.join(texts)
+            self.assertEqual(si._EncodeStringLiteralPy(literal), _fastaccess.EncodeStringLiteral(literal), literal)
             expected = ref(texts)
             self.assertEqual(expected, native(texts), '#%d %r' % (n, texts))
             seed = rnd.random()
@@ -132,6 +137,8 @@ class FuzzTest(unittest.TestCase):
         for n in range(2000):
             texts = [_RandomText(rnd) if rnd.random() < 0.8 else rnd.choice(others)
                      for _ in range(rnd.randint(0, 6))]
+            item = texts[0] if texts else None
+            self.assertEqual(_Outcome(si._EncodeStringLiteralPy, item), _Outcome(_fastaccess.EncodeStringLiteral, item))
             self.assertEqual(_Outcome(si._JoinTokensPy, texts),
                              _Outcome(_fastaccess.JoinTokens, texts), '#%d %r' % (n, texts))
 

@@ -3,21 +3,27 @@
 Every logical line of a file that CPython compiles must analyze to None with
 the grammar of the same version; a line that yields a SyntaxError must be one
 that CPython also rejects (its source, completed as the analyzer completes its
-tokens, does not compile). Also: analyzing the 2.7 standard library five times
-leaves memory flat after the first pass.
+tokens, does not compile). What each analyzed line records is checked against
+CPython's ast of the same completed line (tests/py/astfacts.py; the 3.6 side
+runs in the 3.6 interpreter). Also: analyzing the 2.7 standard library five
+times leaves memory flat after the first pass.
 """
 
 import gc
 import json
 import os
+import re
 import sys
+import unicodedata
 import unittest
 
+from tests.py import astfacts
 from tests.py import support
 
 try:
     from pysource import treelens as tl
     from pysource import analysis
+    from pysource import symbolinfo as si
     from pysource.utils import GetLogicalsFromText
     sys.path.insert(0, os.path.join(support.kRoot, 'bench'))
     from treelens_bench import CompletedSource
@@ -31,8 +37,11 @@ def setUpModule():
         raise unittest.SkipTest('pysource.treelens not importable: %s' % _kImportError)
 
 
-def Analyze(analyzer, text, async_scopes, counts):
-    """(logical, result) of every logical line of text whose result is not None."""
+def Analyze(analyzer, text, async_scopes, counts, analyzed=None):
+    """(logical, result) of every logical line of text whose result is not None.
+
+    The lines that analyze to None are appended to `analyzed`.
+    """
     failed = []
     logicals = GetLogicalsFromText(text)
     counts.append(len(logicals))
@@ -41,7 +50,79 @@ def Analyze(analyzer, text, async_scopes, counts):
         result = analyzer.AnalyzeSingleLogical(logical, in_async)
         if result is not None:
             failed.append((logical, result))
+        elif analyzed is not None:
+            analyzed.append(logical)
     return failed
+
+
+kWord = re.compile(br'[A-Za-z_][A-Za-z_0-9]*')
+kQuoted = re.compile(br"'[^']*'")  # an encoded string literal in a rendered name
+
+
+def Recorded(logical):
+    """What the analyzer recorded on a logical, in the terms of the ast facts."""
+    equivs = logical.fTypeEquivs
+    return {'tokens': [t for t, _ in logical.fTokens], 'defined': set(logical.fNamesDefined),
+            'reads': set(n for n, i in equivs if i == si.kGetPrefix),
+            'within': [(n, i) for n, i in equivs if i.startswith(si.kWithinExprPrefix)],
+            'equivs': set(equivs), 'args': logical.fArgNames, 'bases': logical.fBaseClassNames}
+
+
+def NFKC(name):
+    return unicodedata.normalize('NFKC', name.decode('utf-8', 'replace')).encode('utf-8')
+
+
+def Disagreements(rec, facts):
+    """Where the recorded info and CPython's ast facts of one line disagree."""
+    utf8 = lambda names: [n.encode('utf-8') if not isinstance(n, bytes) else n for n in names]
+    tokens, out = rec['tokens'], []
+    if any(ord(c) > 127 for c in b''.join(tokens)):  # CPython 3 binds identifiers NFKC-normalized
+        rec = dict(rec, defined=set(NFKC(n) for n in rec['defined']), reads=set(NFKC(n) for n in rec['reads']))
+    significant = [t for t in tokens if not t.startswith((b'#', b'\\'))]
+    out.extend('binds %s' % n for n in utf8(facts['bound']) if n not in rec['defined'])
+    out.extend('reads %s' % n for n in utf8(facts['loads']) if n not in rec['reads'])
+    # A name read may be rendered with subscripts, calls and literals (`a[i].f`, `','.join`):
+    # its words must be on the line.
+    line = b' '.join(tokens)
+    out.extend('reads absent %s' % n for n in rec['reads'] if any(w not in line for w in kWord.findall(kQuoted.sub(b'', n))))
+    for name, info in rec['within']:
+        i = int(info[len(si.kWithinExprPrefix):])
+        if not (0 <= i < len(tokens) and tokens[i] == name.split(b'.')[-1]):
+            out.append('within %s at %d' % (name, i))
+    bound_within = set(n for n, _ in rec['within'])
+    out.extend('no within %s' % n for n in utf8(facts['within']) if n not in bound_within)
+    out.extend('global %s' % n for n in utf8(facts['globals']) if (n, si.kGlobalPrefix) not in rec['equivs'])
+    out.extend('nonlocal %s' % n for n in utf8(facts['nonlocals'])
+               if (n, si.kNonlocalPrefix) not in rec['equivs'])
+    if significant[:1] == [b'def'] or significant[:2] == [b'async', b'def']:
+        if facts['args'] is not None and utf8(facts['args']) != rec['args']:
+            out.append('args %r' % rec['args'])
+    if significant[:1] == [b'class'] and facts['bases'] is not None and utf8(facts['bases']) != rec['bases']:
+        out.append('bases %r' % rec['bases'])
+    return out
+
+
+def JudgeByAst(path, logicals, facts_of, wrong):
+    """Checks each analyzed logical against the ast facts of its completed source.
+
+    facts_of maps a list of completed sources to their facts (None where CPython cannot parse).
+    """
+    recs = [(l.fFirstLine + 1, l.fLineText[:120], Recorded(l)) for l in logicals]
+    facts = facts_of([CompletedSource(l) for l in logicals])
+    for (line, text, rec), fact in zip(recs, facts):
+        if fact is not None:
+            wrong.extend('%s:%d: %r: %s' % (path, line, text, d) for d in Disagreements(rec, fact))
+
+
+def Facts36(sources):
+    """The ast facts of sources as the 3.6 interpreter gives them."""
+    data = json.dumps([[str(i), src.decode('latin-1')] for i, src in enumerate(sources)])
+    out = json.loads(support.RunOracle('3.6', kFactsMain, data))
+    return [out[str(i)] for i in range(len(sources))]
+
+
+kFactsMain = 'import sys; sys.path.insert(0, %r); import astfacts; astfacts.Main()' % os.path.dirname(
+    os.path.abspath(__file__))
 
 
 def Describe(path, logical, result):
@@ -83,22 +164,27 @@ class Corpus27Test(unittest.TestCase):
     def testStdlib(self):
         analyzer = analysis.GetAnalyzer('2.7')
         files = support.CorpusFiles('2.7')
-        wrong, print_function_files, rejected_files, counts = [], 0, 0, []
+        wrong, judged, print_function_files, rejected_files, counts = [], [], 0, 0, []
         for path in files:
             text = support.ReadBytes(path)
             logicals = GetLogicalsFromText(text)
-            if analysis.UsesPrintFunction(logicals):
-                print_function_files += 1
-            failed = Analyze(analyzer.ImplFor(logicals), text, False, counts)
+            uses_print_function = analysis.UsesPrintFunction(logicals)
+            print_function_files += uses_print_function
+            analyzed = []
+            failed = Analyze(analyzer.ImplFor(logicals), text, False, counts, analyzed)
+            if not uses_print_function:  # ast.parse has no print_function flag here
+                JudgeByAst(path, analyzed, lambda srcs: [astfacts.Facts(s) for s in srcs], judged)
             if Compiles27(text):
                 wrong.extend(Describe(path, l, r) for l, r in failed)
                 continue
             rejected_files += 1
             wrong.extend(Describe(path, l, r) for l, r in failed if Compiles27(CompletedSource(l)))
         sys.stderr.write('\n2.7 corpus: %d files (%d rejected by CPython, %d import print_function), '
-                         '%d logical lines, %d disagree\n'
-                         % (len(files), rejected_files, print_function_files, sum(counts), len(wrong)))
+                         '%d logical lines, %d disagree, %d disagree with the ast\n'
+                         % (len(files), rejected_files, print_function_files, sum(counts), len(wrong),
+                            len(judged)))
         self.assertEqual(wrong[:40], [])
+        self.assertEqual(judged[:40], [], '\n'.join(judged[:40]))
 
 
 class Corpus36Test(unittest.TestCase):
@@ -107,21 +193,25 @@ class Corpus36Test(unittest.TestCase):
         files = support.CorpusFiles('3.6')
         if not files or support.Interpreter('3.6') is None:
             self.skipTest('no Python 3.6 standard library')
-        analyzer = tl.CPGenAnalyzerImpl((3, 6, 0), 'Python-Grammar-3.6', None, True)
+        analyzer = analysis.GetAnalyzer('3.6').ImplFor([])
         texts = [(path, support.ReadBytes(path)) for path in files]
         compiling = OracleCompiles('3.6', texts)
-        wrong, suspects, counts = [], [], []
+        wrong, judged, suspects, counts = [], [], [], []
         for path, text in texts:
-            for logical, result in Analyze(analyzer, text, True, counts):
+            analyzed = []
+            for logical, result in Analyze(analyzer, text, True, counts, analyzed):
                 if path in compiling:
                     wrong.append(Describe(path, logical, result))
                 else:
                     suspects.append((len(suspects), (path, logical, result)))
+            JudgeByAst(path, analyzed, Facts36, judged)
         accepted = OracleCompiles('3.6', [(i, CompletedSource(l)) for i, (_, l, _) in suspects])
         wrong.extend(Describe(*item) for i, item in suspects if i in accepted)
-        sys.stderr.write('\n3.6 corpus: %d files (%d rejected by CPython), %d logical lines, %d disagree\n'
-                         % (len(texts), len(texts) - len(compiling), sum(counts), len(wrong)))
+        sys.stderr.write('\n3.6 corpus: %d files (%d rejected by CPython), %d logical lines, %d disagree, '
+                         '%d disagree with the ast\n'
+                         % (len(texts), len(texts) - len(compiling), sum(counts), len(wrong), len(judged)))
         self.assertEqual(wrong[:40], [])
+        self.assertEqual(judged[:40], [], '\n'.join(judged[:40]))
 
 
 def ResidentBytes():

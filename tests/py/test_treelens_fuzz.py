@@ -17,10 +17,35 @@ except ImportError as _exc:  # native modules not built
     tl = None
     _kImportError = str(_exc)
 
-kRounds = 600 if support.kSanitized else 3000
+import os
+
+# $TREELENS_FUZZ_ROUNDS and $TREELENS_FUZZ_SEED run it longer or differently.
+kRounds = int(os.environ.get('TREELENS_FUZZ_ROUNDS') or (600 if support.kSanitized else 3000))
+kSeed = int(os.environ.get('TREELENS_FUZZ_SEED') or 20261206)
 kSpecial = [b'\\', b'$', b'?', b'...', b'async', b'await', b'@', b'->', b'else', b'except',
             b'finally', b'elif', b'try', b'def', b'class', b'lambda', b':', b'(', b')', b'[',
             b'{', b'}', b',', b'*', b'**', b'=', b'f"{x}"', b'# type: int', b'\n']
+
+
+def RandomFString(rnd, depth=0):
+    """An f-string token, often malformed: random fields, stray braces and quotes, nested f-strings."""
+    quote = rnd.choice([b"'", b'"', b"'''", b'"""'])
+    body = []
+    for _ in range(rnd.randrange(1, 5)):
+        kind = rnd.randrange(6)
+        if kind == 0:
+            body.append(rnd.choice([b'a', b' ', b'{{', b'}}', b'\\N{DASH}', b':', b'!', b'\n']))
+        elif kind in (1, 2):
+            expr = b' '.join(rnd.choice([b'x', b'a.b', b'd[0]', b'f(y)', b'!=', b'+', b'(', b')', b'[', b']',
+                                         b'"s"', b"'('", b'=', b'lambda', b';', b'1', b'\n'])
+                             for _ in range(rnd.randrange(1, 4)))
+            tail = rnd.choice([b'', b'!r', b'!s:>10', b':{w}', b':%H:%M', b':{'])
+            body.append(b'{' + expr + tail + rnd.choice([b'}', b'}', b'']))
+        elif kind == 3:
+            body.append(rnd.choice([b'{', b'}', b"'", b'"', b'\\']))
+        elif depth < 8:
+            body.append(b'{' + RandomFString(rnd, depth + 1) + b'}')
+    return rnd.choice([b'f', b'F', b'rf', b'fR', b'Rf']) + quote + b''.join(body) + rnd.choice([quote, quote, b''])
 
 
 class _Collect(logging.Handler):
@@ -44,7 +69,7 @@ class FuzzTest(unittest.TestCase):
         logging.getLogger('pysource').removeHandler(self.handler)
 
     def testMangledLines(self):
-        rnd = random.Random(20261206)
+        rnd = random.Random(kSeed)
         analyzers = [tl.CPGenAnalyzerImpl((2, 7, 0), tl.kPy2DefaultGrammar, None, False),
                      tl.CPGenAnalyzerImpl((3, 5, 0), 'Python-Grammar-3.5'),
                      tl.CPGenAnalyzerImpl((3, 6, 0)),
@@ -84,11 +109,31 @@ class FuzzTest(unittest.TestCase):
                     results[SyntaxError] += 1
         self.assertEqual([r.getMessage() for r in self.handler.records], [])
         self.assertTrue(results[None] and results[SyntaxError], results)
+        self.CheckFStrings(rnd, analyzers)
         # Nothing handed out twice: two parses of one line share no node.
         logical = utils.GetLogicalsFromText(b'x = f(a, [b for b in c]) + 1\n')[0]
         parser = tl.CPGenParserImpl((3, 6, 0))
         first, second = parser.ParseToNode(logical, False), parser.ParseToNode(logical, False)
         self.assertIsNot(first, second)
+
+    def CheckFStrings(self, rnd, analyzers):
+        """Random f-strings: every part lies where it says, and analysis gives None or a located error."""
+        sup = tl.CFStringSupport()
+        for _ in range(kRounds // 3):
+            token = RandomFString(rnd)
+            src = rnd.choice([b'x = ', b'f(1,\n  ', b'']) + token + b'\n'
+            for logical in utils.GetLogicalsFromText(src):
+                for tok, _ in sup._FStringTokenList(logical):
+                    for text, pos, _ in sup.GetPartList(tok):
+                        self.assertEqual(tok[pos:pos + len(text)], text, repr(tok))
+                for analyzer in analyzers:
+                    logical.fInspected = False
+                    result = analyzer.AnalyzeSingleLogical(logical, False)
+                    if result is not None:
+                        self.assertIsInstance(result, SyntaxError, repr(src))
+                        self.assertEqual(result.filename, '<string>')
+                        self.assertGreaterEqual(min(result.lineno, result.offset), 1, repr(src))
+                        self.assertEqual((logical.fNamesDefined, logical.fTypeEquivs), ([], []))
 
 
 if __name__ == '__main__':

@@ -287,6 +287,13 @@ PyMethodDef AnalyzerMethods[] = {
     {"_InspectSingleLogical", tl::kwFunction(analyzer_InspectSingleLogical),
      METH_VARARGS | METH_KEYWORDS,
      "_InspectSingleLogical(logical, in_async_def, in_f_string=False) -> True: parses and walks the logical"},
+    {"_InspectFStringTokens", tl::kwFunction(fstrings::analyzer_InspectFStringTokens),
+     METH_VARARGS | METH_KEYWORDS,
+     "_InspectFStringTokens(logical, in_async_def): analyzes the expressions of the logical's f-strings"},
+    {"_InspectSingleFStringToken", tl::kwFunction(fstrings::analyzer_InspectSingleFStringToken),
+     METH_VARARGS | METH_KEYWORDS,
+     "_InspectSingleFStringToken(logical, token_i, text, in_async_def): analyzes the expressions of one "
+     "f-string token and copies their findings into the logical"},
     {"ParseToNode", tl::kwFunction(analyzer_ParseToNode), METH_VARARGS | METH_KEYWORDS,
      "ParseToNode(logical, in_async_def) -> CNode or None"},
     {"ParseTokenListToNode", tl::kwFunction(analyzer_ParseTokenListToNode),
@@ -421,7 +428,8 @@ int initAnalyzerType(PyObject *Module) {
                         {"__GetTime", F::Object, offsetof(AnalyzerObject, GetTime)},
                         {"_fNodeWalker", F::Object, offsetof(AnalyzerObject, NodeWalker)},
                         {"_fTypeHintWalker", F::Object, offsetof(AnalyzerObject, TypeHintWalker)},
-                        {"_fFStringSupport", F::Object, offsetof(AnalyzerObject, FStringSupport)}},
+                        {"_fFStringSupport", F::Object, offsetof(AnalyzerObject, FStringSupport),
+                         &fstrings::fstringSupportType()}},
                        Host.UnpickleFields);
     return 0;
   });

@@ -130,6 +130,14 @@ inline void clearDerivedInfo(PyObject *Logical) {
 TL_HIDDEN extern PyMethodDef RecordFunctions[];
 TL_HIDDEN extern PyMethodDef SymbolInfoFunctions[];
 
+/// F(Arg) for a host function; a native one-argument function is called
+/// directly, without building an argument tuple. New reference; throws PyErrSet.
+inline tl::Ref callOne(PyObject *F, PyObject *Arg) {
+  if (PyCFunction_Check(F) && PyCFunction_GET_FLAGS(F) == METH_O)
+    return tl::require(PyCFunction_GET_FUNCTION(F)(PyCFunction_GET_SELF(F), Arg));
+  return tl::require(PyObject_CallFunctionObjArgs(F, Arg, nullptr));
+}
+
 /// Byte of a one-character constant (a byte string or an int); throws otherwise.
 TL_HIDDEN char kindByte(PyObject *O, const char *What);
 

@@ -106,7 +106,7 @@ Ref ownTextForStringLiteral(ConverterObject *Cv, NodeObject *N) {
     while (P != End && isPlainStringByte(*P))
       ++P;
     if (P == End)
-      return checkedText(tl::require(PyObject_CallFunctionObjArgs(host::Host.EncodeStringLiteral, Text, nullptr)));
+      return checkedText(host::callOne(host::Host.EncodeStringLiteral, Text));
   }
   return Ref::borrow(stringIsUnicode(N) ? Names.EmptyUnicode : Names.EmptyString);
 }

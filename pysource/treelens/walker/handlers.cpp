@@ -169,10 +169,12 @@ struct Nesting {
 
 bool isSequenceTarget(PyObject *O) { return isNodeOf(O, C::CTestListStarExpr) || isNodeOf(O, C::CAtom); }
 
+/// The host's literal info, built here: kTypedLiteralPrefix, the kind and ":", then " " and the
+/// literal's text unless it has none.
 Ref buildLiteralInfo(PyObject *Kind, PyObject *Text) {
-  Ref R = tl::require(PyObject_CallFunctionObjArgs(Host.BuildLiteralInfo, Kind, Text, nullptr));
-  tl::expectType(PyString_Check(R.get()), "bytes", R.get());
-  return R;
+  if (Text == Py_None)
+    return concat({sym(Sym::kTypedLiteralPrefix), Kind, K.Colon});
+  return concat({sym(Sym::kTypedLiteralPrefix), Kind, K.ColonBlank, Text});
 }
 
 } // namespace
@@ -195,6 +197,15 @@ void initWalkerConstants() {
   K.KindInt = tl::internName("int");
   K.KindFloat = tl::internName("float");
   K.Isinstance = tl::internName("isinstance");
+  K.Colon = tl::internName(":");
+  K.ColonBlank = tl::internName(": ");
+  K.Semicolon = tl::internName(";");
+  K.Blank = tl::internName(" ");
+  K.Star = tl::internName("*");
+  K.BlankStar = tl::internName(" *");
+  K.Return = tl::internName("return");
+  K.Yield = tl::internName("yield");
+  K.FromBlank = tl::internName("from ");
   K.MimicName = tl::internName("kMimicAstInspectBugs");
   K.AppendTypeEquiv = tl::internName("AppendTypeEquiv");
   K.AppendArgName = tl::internName("AppendArgName");
@@ -223,7 +234,12 @@ void processLoadName(NW *W, PyObject *Name) {
   tl::requireStatus(PyDict_SetItem(dictField(W->LoadedNames, "_fLoadedNames"), Name, K.Empty));
 }
 
-void visitNameLiteral(NW *W, PyObject *Node, PyObject *Atom, PyObject *AllTrailers, Py_ssize_t TrailerI) {
+namespace {
+
+/// visitNameLiteral; Rendered, when given, is the text of the atom with its
+/// first TrailerI + 1 trailers, already known to the caller.
+void visitName(NW *W, PyObject *Node, PyObject *Atom, PyObject *AllTrailers, Py_ssize_t TrailerI,
+               const std::string *Rendered) {
   NodeObject *N = asAnyNode(Node);
   Ref Name = field(N->Text);
   if (!PyString_Check(Name.get()) || isLiteralNameText(Name.get()))
@@ -231,7 +247,9 @@ void visitNameLiteral(NW *W, PyObject *Node, PyObject *Atom, PyObject *AllTraile
   bool Load = false;
   if (AllTrailers != Py_None) {
     asList(AllTrailers);
-    if (TrailerI >= 0) {
+    if (TrailerI >= 0 && Rendered) {
+      Name = bytes(*Rendered);
+    } else if (TrailerI >= 0) {
       Ref Leading = tl::require(PyList_GetSlice(AllTrailers, 0, TrailerI + 1));
       Name = textForAtomPlusTrailers(W->ToText, Atom, Leading.get());
       if (isNone(Name))
@@ -246,11 +264,16 @@ void visitNameLiteral(NW *W, PyObject *Node, PyObject *Atom, PyObject *AllTraile
     PyObject *Stored = dictField(W->StoredNames, "_fStoredNames");
     Ref Old = Ref::borrow(PyDict_GetItem(Stored, Name.get()));
     if (Old) {
-      Ref Sep = bytes(";");
-      Info = concat({Old.get(), Sep.get(), Info.get()});
+      Info = concat({Old.get(), K.Semicolon, Info.get()});
     }
     tl::requireStatus(PyDict_SetItem(Stored, Name.get(), Info.get()));
   }
+}
+
+} // namespace
+
+void visitNameLiteral(NW *W, PyObject *Node, PyObject *Atom, PyObject *AllTrailers, Py_ssize_t TrailerI) {
+  visitName(W, Node, Atom, AllTrailers, TrailerI, nullptr);
 }
 
 void visitDottedName(NW *W, PyObject *Node) {
@@ -360,7 +383,10 @@ void visitWithItem(NW *W, PyObject *Node) {
     visitStoreContextNode(W, Target.get(), false);
 }
 
-void processTargets(NW *W, PyObject *Lhs, PyObject *Rhs) {
+void processTargets(NW *W, PyObject *LhsIn, PyObject *Rhs) {
+  // `(a) = 1` binds a: a parenthesized target is the target inside.
+  Ref Dropped = isNodeOf(LhsIn, C::CAtom) ? dropSimpleParens(LhsIn) : Ref::borrow(LhsIn);
+  PyObject *Lhs = Dropped.get();
   if (!isSequenceTarget(Lhs)) {
     appendEquivNode(W, Lhs, Rhs);
     return;
@@ -426,7 +452,10 @@ void processNamesFound(NW *W, PyObject *Node) {
       tl::raise(PyExc_AssertionError, "None name in _fLoadedNames");
     recordTypeEquiv(W, Name, sym(Sym::kGetPrefix));
   }
-  Ref Stored = tl::require(PyDict_Items(dictField(W->StoredNames, "_fStoredNames")));
+  PyObject *StoredDict = dictField(W->StoredNames, "_fStoredNames");
+  if (PyDict_Size(StoredDict) == 0)
+    return;
+  Ref Stored = tl::require(PyDict_Items(StoredDict));
   for (Py_ssize_t J = 0; J < PyList_GET_SIZE(Stored.get()); ++J) {
     PyObject *Item = PyList_GET_ITEM(Stored.get(), J);
     Name = PyTuple_GET_ITEM(Item, 0);
@@ -502,19 +531,17 @@ void visitFromImport(NW *W, PyObject *Node) {
   if (!isNone(From))
     tl::expectType(PyString_Check(From.get()), "bytes", From.get());
   if (fromImportGetImportStar(N)) {
-    Ref Star = bytes("*"), Tail = bytes(" *");
-    appendLogicalTypeEquiv(W, Star.get(), concat({sym(Sym::kFromImportPrefix), From.get(), Tail.get()}).get());
+    appendLogicalTypeEquiv(W, K.Star, concat({sym(Sym::kFromImportPrefix), From.get(), K.BlankStar}).get());
     return;
   }
   Ref Items = fromImportGetAsNameList(N);
   asList(Items.get());
-  Ref Blank = bytes(" ");
   for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Items.get()); ++I) {
     Ref Item = Ref::borrow(PyList_GET_ITEM(Items.get(), I));
     AsNameObject *A = asAsName(Item.get());
     Ref Name = boundName(A);
     Ref Module = field(A->ModuleName);
-    Ref Info = concat({sym(Sym::kFromImportPrefix), From.get(), Blank.get(), Module.get()});
+    Ref Info = concat({sym(Sym::kFromImportPrefix), From.get(), K.Blank, Module.get()});
     recordImported(W, Name.get(), Info.get());
     if (A->AsName)
       appendLogicalTypeEquiv(W, Name.get(), concat({sym(Sym::kImportAsNamePrefix), Name.get()}).get());
@@ -621,7 +648,7 @@ void visitReturn(NW *W, PyObject *Node) {
   Ref Info = typeEquivForNode(W, Value.get(), nullptr);
   if (isNone(Info) || isTextOf(Info.get(), K.TupleInstance))
     return;
-  recordTypeEquiv(W, bytes("return").get(), Info.get());
+  recordTypeEquiv(W, K.Return, Info.get());
 }
 
 void visitYield(NW *W, PyObject *Node) {
@@ -634,8 +661,8 @@ void visitYield(NW *W, PyObject *Node) {
   if (isNone(Info))
     Info = Ref::borrow(K.Empty);
   if (yieldExprIsYieldFrom(N))
-    Info = concat({bytes("from ").get(), Info.get()});
-  recordTypeEquiv(W, bytes("yield").get(), Info.get());
+    Info = concat({K.FromBlank, Info.get()});
+  recordTypeEquiv(W, K.Yield, Info.get());
 }
 
 void visitSingleDecorator(NW *W, PyObject *Node) {
@@ -727,18 +754,35 @@ void visitAtomPlusTrailers(NW *W, PyObject *Atom, PyObject *AllTrailers) {
   Ref Trailers = Ref::borrow(asList(AllTrailers));
   if (isNodeOf(Atom, C::CNameLiteral))
     visitNameLiteral(W, Atom, Atom, Trailers.get(), -1);
+  else if (PyList_GET_SIZE(Trailers.get()) > 0)
+    visitLoadContextNode(W, Atom); // `(a or b)[k] = v` reads a and b, as a name before trailers is read
   else
     visitNode(W, Atom);
+  // While the atom is a plain name and every trailer so far a plain ".name"
+  // (native classes, the walker's own converter), the dotted text is built
+  // here as the converter would render it, one trailer at a time.
+  PyTypeObject *NameType = &nodeType(C::CNameLiteral);
+  bool Plain = Py_TYPE(Atom) == NameType && Py_TYPE(W->ToText) == &nodeToTextConverterType() &&
+               node(Atom)->Text && PyString_Check(node(Atom)->Text);
+  std::string Dotted = Plain ? std::string(PyString_AS_STRING(node(Atom)->Text), PyString_GET_SIZE(node(Atom)->Text))
+                             : std::string();
   for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Trailers.get()); ++I) {
     Ref Trailer = Ref::borrow(PyList_GET_ITEM(Trailers.get(), I));
     NodeObject *T = asNodeOf(Trailer.get(), C::CTrailer);
     Ref Tok = trailerGetInitialToken(T);
     Ref Inner = ref(childAt(T, 1));
+    Plain = Plain && Py_TYPE(Trailer.get()) == &nodeType(C::CTrailer) && rawCount(T) == 2 &&
+            textIs(Tok.get(), ".") && Py_TYPE(Inner.get()) == NameType && node(Inner.get())->Text &&
+            PyString_Check(node(Inner.get())->Text);
+    if (Plain) {
+      Dotted += '.';
+      Dotted.append(PyString_AS_STRING(node(Inner.get())->Text), PyString_GET_SIZE(node(Inner.get())->Text));
+    }
     if (textIs(Tok.get(), "(") && rawCount(T) == 3) {
       Ref Previous = tl::require(PyList_GetSlice(Trailers.get(), 0, I));
       visitCall(W, Atom, Previous.get(), Inner.get());
     } else if (textIs(Tok.get(), ".") && isNodeOf(Inner.get(), C::CNameLiteral)) {
-      visitNameLiteral(W, Inner.get(), Atom, Trailers.get(), I);
+      visitName(W, Inner.get(), Atom, Trailers.get(), I, Plain ? &Dotted : nullptr);
     } else if (textIs(Tok.get(), "[") || textIs(Tok.get(), "{")) {
       visitLoadContextNode(W, Inner.get());
     } else {
@@ -764,9 +808,10 @@ void processFunctionCall(NW *W, PyObject *FuncName, PyObject *ArgList) {
       PyErr_SetObject(reinterpret_cast<PyObject *>(Py_TYPE(Error.get())), Error.get());
       throw tl::PyErrSet();
     }
+    // Arguments are read even inside an assignment target (`f(x).y = 1` reads x).
     // A bare `*` or `**` without a value (only in broken trees) reads nothing.
     if (!isNone(Value))
-      visitNode(W, Value.get());
+      visitLoadContextNode(W, Value.get());
   }
   if (FuncName != Py_None && isTextOf(FuncName, K.Isinstance))
     processIsInstanceCall(W, Args.get());
@@ -890,10 +935,9 @@ Ref typeEquivForNode(NW *W, PyObject *Node, PyObject *Extra) {
     PyObject *Kind = stringIsUnicode(N) ? K.UnicodeInstance : K.StringInstance;
     if (!W->IncludeExprText)
       return Ref::borrow(Kind);
-    Ref Encoded = tl::require(PyObject_CallFunctionObjArgs(Host.EncodeStringLiteral, Text ? Text : Py_None, nullptr));
+    Ref Encoded = host::callOne(Host.EncodeStringLiteral, Text ? Text : Py_None);
     tl::expectType(PyString_Check(Encoded.get()), "bytes", Encoded.get());
-    Ref Blank = bytes(" ");
-    return concat({Kind, Blank.get(), Encoded.get()});
+    return concat({Kind, K.Blank, Encoded.get()});
   }
   if (isNodeOf(Node, C::CPower)) {
     if (!isNone(powerGetExponentNode(N)))

@@ -299,8 +299,12 @@ void dispatchVisitNodeBase(DispatchWalkerObject *W, PyObject *Node) {
     tl::raise(PyExc_RuntimeError, kTooManyVisits);
   Ref Stack = Ref::borrow(nodeStack(W));
   tl::requireStatus(PyList_Append(Stack.get(), Node));
-  if (PyList_GET_SIZE(Stack.get()) > W->MaxRecurseCount)
+  if (PyList_GET_SIZE(Stack.get()) > W->MaxRecurseCount) {
+    // Taken off again, so that the visits being unwound still find themselves
+    // innermost and the limit is reported rather than a stack out of step.
+    tl::requireStatus(PyList_SetSlice(Stack.get(), PyList_GET_SIZE(Stack.get()) - 1, PyList_GET_SIZE(Stack.get()), nullptr));
     tl::raise(PyExc_RuntimeError, kTooDeep);
+  }
   Ref KeepWalker = Ref::borrow(reinterpret_cast<PyObject *>(W));
   Ref KeepNode = Ref::borrow(Node);
   bool Ok = tl::guard<bool>(false, [&] {

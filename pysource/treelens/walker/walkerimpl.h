@@ -20,6 +20,7 @@ struct WalkerConstants {
   PyObject *IntPrefixOnly, *FloatPrefixOnly;          ///< kTypedLiteralPrefix + "int:" / "float:"
   PyObject *KindSet, *KindDict, *KindInt, *KindFloat; ///< "set", "dict", "int", "float"
   PyObject *Isinstance;                               ///< "isinstance"
+  PyObject *Colon, *ColonBlank, *Semicolon, *Blank, *Star, *BlankStar, *Return, *Yield, *FromBlank;
   PyObject *MimicName;                                ///< "kMimicAstInspectBugs"
   PyObject *AppendTypeEquiv, *AppendArgName, *AppendArgTypeEquiv, *AppendBaseClassName;
   PyObject *GenExprMessage, *ExceptNameMessage;

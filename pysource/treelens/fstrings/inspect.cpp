@@ -1,0 +1,255 @@
+// The analyzer's f-string inspection: every expression in a logical line's f-strings is analyzed as
+// a logical line of its own, and the names and type equivalences found join the outer line.
+#include "pysource/treelens/fstrings/fstrings.h"
+
+#include "override.h"
+#include "pysource/treelens/front/front.h"
+#include "pysource/treelens/host/host.h"
+
+#include <cstring>
+
+namespace treelens {
+namespace fstrings {
+
+using host::Host;
+using host::LogicalLineObject;
+using tl::Ref;
+
+namespace {
+
+AnalyzerObject *analyzer(PyObject *O) { return reinterpret_cast<AnalyzerObject *>(O); }
+LogicalLineObject *record(PyObject *O) { return reinterpret_cast<LogicalLineObject *>(O); }
+
+/// The analyzer's CFStringSupport (or an instance of a subclass).
+PyObject *supportOf(AnalyzerObject *A) {
+  PyObject *S = A->FStringSupport;
+  if (!S || !PyObject_TypeCheck(S, &fstringSupportType()))
+    tl::raise(PyExc_TypeError, "_fFStringSupport is not a CFStringSupport");
+  return S;
+}
+
+/// A snapshot of a record's derived-info list (its appends may target the same record).
+Ref snapshot(PyObject *List) {
+  if (!List)
+    return Ref();
+  tl::expectType(PyList_Check(List), "list", List);
+  return tl::require(PyList_GetSlice(List, 0, PY_SSIZE_T_MAX));
+}
+
+/// Appends Sub's type equivalences and names defined to Logical.
+void copyFindings(PyObject *Logical, PyObject *Sub) {
+  Ref Equivs = snapshot(record(Sub)->TypeEquivs);
+  Ref Defined = snapshot(record(Sub)->NamesDefined);
+  for (Py_ssize_t I = 0; Equivs && I < PyList_GET_SIZE(Equivs.get()); ++I) {
+    PyObject *Pair = PyList_GET_ITEM(Equivs.get(), I);
+    tl::expectType(PyTuple_Check(Pair) && PyTuple_GET_SIZE(Pair) == 2, "tuple", Pair);
+    tl::requireStatus(Host.Fast->AppendTypeEquiv(Logical, PyTuple_GET_ITEM(Pair, 0), PyTuple_GET_ITEM(Pair, 1)));
+  }
+  for (Py_ssize_t I = 0; Defined && I < PyList_GET_SIZE(Defined.get()); ++I) {
+    PyObject *Name = PyList_GET_ITEM(Defined.get(), I);
+    tl::expectType(PyString_Check(Name), "bytes", Name);
+    tl::requireStatus(Host.Fast->AppendAttrib(Logical, Name));
+  }
+}
+
+/// 1-based (line, column) of token TokI of a record as its SyntaxError gives
+/// them: past the last token for a completion token, (1, 1) for no tokens.
+void errorPosition(LogicalLineObject *L, Py_ssize_t TokI, long &Line, long &Column) {
+  Py_ssize_t Count = L->TokenCount;
+  Line = Column = 1;
+  if (Count == 0)
+    return;
+  if (TokI >= 0 && TokI < Count) {
+    Line = L->Positions[TokI].Row + 1;
+    Column = L->Positions[TokI].Col + 1;
+    return;
+  }
+  PyObject *Last = L->Texts[Count - 1];
+  Line = L->Positions[Count - 1].Row + 1;
+  Column = L->Positions[Count - 1].Col + 1 + (Last && PyString_Check(Last) ? PyString_GET_SIZE(Last) : 0);
+}
+
+/// Clears Logical's derived info and raises "invalid syntax" located, 1-based,
+/// at token SubTokI of the sub-logical Sub, in the outer line's source.
+[[noreturn]] void raiseLocated(PyObject *Logical, Py_ssize_t TokenI, PyObject *Text, Py_ssize_t PartPos,
+                               PyObject *Sub, Py_ssize_t SubTokI) {
+  host::clearDerivedInfo(Logical);
+
+  // The f-string token's own position.
+  LogicalLineObject *L = record(Logical);
+  Py_ssize_t Count = L->TokenCount;
+  Py_ssize_t I = TokenI < Count ? (TokenI < 0 ? TokenI + Count : TokenI) : Count - 1;
+  if (I < 0 || I >= Count)
+    tl::raise(PyExc_IndexError, "tuple index out of range");
+  long Row = L->Positions[I].Row, Col = L->Positions[I].Col;
+
+  // The line, and the column within it, of the part's first byte in the token.
+  const char *S = PyString_AS_STRING(Text);
+  Py_ssize_t N = PyString_GET_SIZE(Text);
+  Py_ssize_t Pos = PartPos < 0 ? 0 : (PartPos > N ? N : PartPos), LineStart = 0;
+  for (Py_ssize_t K = 0; K < Pos; ++K) {
+    if (S[K] == '\n' || (S[K] == '\r' && (K + 1 == N || S[K + 1] != '\n'))) {
+      ++Row;
+      LineStart = K + 1;
+    }
+  }
+
+  long InnerLine, InnerColumn;
+  LogicalLineObject *SubL = record(Sub);
+  errorPosition(SubL, SubTokI, InnerLine, InnerColumn);
+  if (InnerLine == 1 && SubL->FirstLine == 0) {
+    Col = (LineStart ? 0 : Col) + static_cast<long>(Pos - LineStart) + InnerColumn - 1;
+  } else {
+    Row += SubL->FirstLine + InnerLine - 1;
+    Col = InnerColumn - 1;
+  }
+
+  static PyObject *InvalidSyntax = tl::internName("invalid syntax");
+  Ref Source = tl::require(PyObject_CallMethod(Host.LogicalInspect, const_cast<char *>("TextFromTokens"),
+                                               const_cast<char *>("(O)"), Logical));
+  Ref Error = tl::require(PyObject_CallFunction(PyExc_SyntaxError, const_cast<char *>("(O(sllO))"), InvalidSyntax,
+                                                "<string>", Row + 1, Col + 1, Source.get()));
+  PyErr_SetObject(PyExc_SyntaxError, Error.get());
+  throw tl::PyErrSet();
+}
+
+/// The token index of a ParseError pending (cleared).
+Py_ssize_t parseErrorContext() {
+  PyObject *Type, *Value, *Tb;
+  PyErr_Fetch(&Type, &Value, &Tb);
+  PyErr_NormalizeException(&Type, &Value, &Tb);
+  Ref HoldType = Ref::steal(Type), HoldValue = Ref::steal(Value), HoldTb = Ref::steal(Tb);
+  Ref Context = tl::require(PyObject_GetAttrString(Value ? Value : Py_None, "context"));
+  Py_ssize_t TokI = PyNumber_AsSsize_t(Context.get(), PyExc_OverflowError);
+  if (TokI == -1 && PyErr_Occurred())
+    throw tl::PyErrSet();
+  return TokI;
+}
+
+bool textIs(PyObject *T, const char *Word) {
+  Py_ssize_t N = static_cast<Py_ssize_t>(std::strlen(Word));
+  return PyString_GET_SIZE(T) == N && std::memcmp(PyString_AS_STRING(T), Word, N) == 0;
+}
+
+/// A statement keyword: it never starts an expression.
+bool isStatementKeyword(PyObject *T) {
+  static const char *const Words[] = {"pass", "break", "continue", "return", "raise", "global", "nonlocal",
+                                      "del", "import", "from", "assert", "if", "elif", "else", "while",
+                                      "for", "try", "except", "finally", "with", "def", "class", "@"};
+  for (const char *W : Words)
+    if (textIs(T, W))
+      return true;
+  return false;
+}
+
+/// Outside brackets, a token that only a statement holds: an assignment, an
+/// annotation colon or a statement separator.
+bool isStatementOperator(PyObject *T) {
+  static const char *const Ops[] = {"=",  ":",  ";",  "+=",  "-=",  "*=",  "/=",  "%=", "&=",
+                                    "|=", "^=", "<<=", ">>=", "**=", "//=", "@="};
+  for (const char *O : Ops)
+    if (textIs(T, O))
+      return true;
+  return false;
+}
+
+/// Index of the token that makes Sub a statement rather than an expression,
+/// or -1. The grammar parses an expression part as a whole logical line, while
+/// the language takes only an expression there: `f'{x = 1}'`, `f'{del x}'` and
+/// `f'{a; b}'` are errors, and must not record their bindings.
+Py_ssize_t statementToken(LogicalLineObject *Sub) {
+  int Depth = 0;
+  bool First = true;
+  for (Py_ssize_t I = 0; I < Sub->TokenCount; ++I) {
+    PyObject *T = Sub->Texts[I];
+    if (!T || !PyString_Check(T) || PyString_GET_SIZE(T) == 0)
+      continue;
+    char C = PyString_AS_STRING(T)[0];
+    if (C == '#' || C == '\\')
+      continue;
+    if (First) {
+      First = false;
+      if (isStatementKeyword(T))
+        return I;
+      // async def, async for, async with
+      if (textIs(T, "async") && I + 1 < Sub->TokenCount && Sub->Texts[I + 1] && PyString_Check(Sub->Texts[I + 1]) &&
+          (textIs(Sub->Texts[I + 1], "def") || textIs(Sub->Texts[I + 1], "for") || textIs(Sub->Texts[I + 1], "with")))
+        return I;
+    }
+    if (PyString_GET_SIZE(T) == 1 && (C == '(' || C == '[' || C == '{'))
+      ++Depth;
+    else if (PyString_GET_SIZE(T) == 1 && (C == ')' || C == ']' || C == '}'))
+      --Depth;
+    else if (Depth == 0 && isStatementOperator(T))
+      return I;
+  }
+  return -1;
+}
+
+/// _InspectSingleFStringToken: analyzes each expression of the token Text (at
+/// index TokenI of Logical) with f-string inspection suppressed and copies
+/// its findings into Logical.
+void inspectSingleFStringToken(AnalyzerObject *A, PyObject *Logical, Py_ssize_t TokenI, PyObject *Text,
+                               bool InAsyncDef) {
+  std::vector<ExprItem> Items = expressionPartList(supportOf(A), Text, /*WantText=*/false);
+  for (ExprItem &It : Items) {
+    PyObject *Sub = It.Logical ? It.Logical.get() : Py_None;
+    if (host::isLogical(Sub)) {
+      Py_ssize_t At = statementToken(record(Sub));
+      if (At >= 0)
+        raiseLocated(Logical, TokenI, Text, It.Pos, Sub, At);
+    }
+    bool Ok = tl::guard<bool>(false, [&] {
+      inspectSingleLogical(A, Sub, InAsyncDef, /*InFString=*/true);
+      return true;
+    });
+    if (!Ok) {
+      if (PyErr_ExceptionMatches(Host.ParseError))
+        raiseLocated(Logical, TokenI, Text, It.Pos, Sub, parseErrorContext());
+      throw tl::PyErrSet();
+    }
+    copyFindings(Logical, Sub);
+  }
+}
+
+} // namespace
+
+void inspectFStringTokens(PyObject *Analyzer, PyObject *Logical, bool InAsyncDef) {
+  LogicalLineObject *L = host::requireLogicalArg(Logical, "logical");
+  for (Py_ssize_t I = 0; I < L->TokenCount; ++I) {
+    Ref Text = Ref::borrow(host::logicalTokenText(L, I));
+    if (!isFString(Text.get()))
+      continue;
+    inspectSingleFStringToken(analyzer(Analyzer), Logical, I, Text.get(), InAsyncDef);
+  }
+}
+
+PyObject *analyzer_InspectFStringTokens(PyObject *Self, PyObject *Args, PyObject *Kwds) {
+  return tl::guard<PyObject *>(nullptr, [&] {
+    static const char *Keywords[] = {"logical", "in_async_def", nullptr};
+    PyObject *Logical, *InAsyncDef;
+    if (!PyArg_ParseTupleAndKeywords(Args, Kwds, "OO:_InspectFStringTokens", const_cast<char **>(Keywords), &Logical,
+                                     &InAsyncDef))
+      throw tl::PyErrSet();
+    inspectFStringTokens(Self, Logical, tl::isTrue(InAsyncDef));
+    Py_RETURN_NONE;
+  });
+}
+
+PyObject *analyzer_InspectSingleFStringToken(PyObject *Self, PyObject *Args, PyObject *Kwds) {
+  return tl::guard<PyObject *>(nullptr, [&] {
+    static const char *Keywords[] = {"logical", "token_i", "text", "in_async_def", nullptr};
+    PyObject *Logical, *Text, *InAsyncDef;
+    Py_ssize_t TokenI;
+    if (!PyArg_ParseTupleAndKeywords(Args, Kwds, "OnOO:_InspectSingleFStringToken", const_cast<char **>(Keywords),
+                                     &Logical, &TokenI, &Text, &InAsyncDef))
+      throw tl::PyErrSet();
+    host::requireLogicalArg(Logical, "logical");
+    tl::expectType(PyString_Check(Text), "bytes", Text);
+    inspectSingleFStringToken(analyzer(Self), Logical, TokenI, Text, tl::isTrue(InAsyncDef));
+    Py_RETURN_NONE;
+  });
+}
+
+} // namespace fstrings
+} // namespace treelens
