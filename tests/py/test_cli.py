@@ -141,6 +141,19 @@ class CliTest(unittest.TestCase):
             self.assertEqual(one[0], two[0], fmt)
             self.assertTrue(one[1] == two[1], fmt)   # (no diff of megabytes)
             self.assertGreater(len(one[1]), 100000, fmt)
+            if fmt == 'jsonl':
+                self.CheckRoundTrip(one[1])
+
+    def CheckRoundTrip(self, jsonl):
+        """Every file's line texts, in order, give back the file."""
+        texts = {}
+        for line in jsonl.splitlines():
+            entry = json.loads(line)
+            texts.setdefault(entry['path'], []).append(Lossless(entry['text']))
+        for path, parts in texts.items():
+            text = support.ReadBytes(path)
+            self.assertEqual(b''.join(parts), text[3:] if text[:3] == b'\xef\xbb\xbf' else text,
+                             path)
 
 
 class ProgressTest(unittest.TestCase):
