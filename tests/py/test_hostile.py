@@ -278,6 +278,28 @@ class RegressionTest(HostileTestBase):
             raw = (300, None, 0, [raw, (1, b'y', 0, None)])
         self.assertIsInstance(factory.RecursiveConvert(raw), tl.CNode)
 
+    def testExtremeIndexes(self):
+        # Index arithmetic saturates (the sanitizer build checks for overflow).
+        tree = self.parser.ParseTokenListToNode(
+            [b'x', b'=', b'[', b'a', b',', b'b', b']', b',', b'(', b'c', b',', b')', b'=', b'd'], False)
+        nodes, stack = [], [tree]
+        while stack:
+            nodes.append(stack.pop())
+            stack.extend(nodes[-1].fChildren or [])
+        calls = 0
+        for node in nodes:
+            for name in _NativeCallables(node):
+                if not name.startswith('Get') or name in ('GetChildCount', 'GetStateName'):
+                    continue
+                for index in (2 ** 63 - 1, -2 ** 63, 2 ** 62, -2 ** 62 - 1):
+                    try:
+                        getattr(node, name)(index)
+                        calls += 1
+                    except (TypeError, ValueError, IndexError, OverflowError):
+                        calls += 1
+        self.assertGreater(calls, 50)
+        self.assertIsInstance(self.parser.ParseTokenListToNode([b'y', b'=', b'2'], False), tl.CExprStmt)
+
     def testSyntaxErrorTextBounded(self):
         cases = [
             ([(b'x', (-10 ** 8, 0)), (b'y', (10 ** 8, 5))], b'x y'),
@@ -347,11 +369,24 @@ class _World(object):
         for toks in ([b'x', b'=', b'(', b'a', b',', b'b', b')'], [b'def', b'f', b'(', b'a', b',', b'*', b'b',
                      b',', b'c', b'=', b'1', b')', b':'], [b'f', b'(', b'*', b'a', b',', b'k', b'=', b'1', b')']):
             self._Collect(self.parsers[0].ParseTokenListToNode(toks, False))
+        self.nodes += self._HostileNodes()
         self.engines = [optpgen.Parser(self.grammar), optpgen.Parser(self.grammar, self._Converter(self)),
                         optpgen.Parser(self.grammar, self.parsers[1], True)]
         self.lists = [[b'x', b'=', b'1'], [(1, b'x', 0), (4, b'\n', 1), (0, b'', 2)], []]
         cycle = []
         cycle.append(cycle)
+        world = self
+
+        class HostileList(list):
+            def __iter__(self):
+                world.Mischief()
+                return list.__iter__(self)
+
+            def __len__(self):
+                world.Mischief()
+                return list.__len__(self)
+        self.lists.append(HostileList([b'x', b'=', b'(', b'1', b')']))
+        self.lists.append(HostileList([(1, b'x', 0), (22, b'=', 1), (2, b'1', 2), (4, b'\n', 3)]))
         self.scalars = [None, True, 0, 1, -1, 255, 256, 300, 2 ** 31 - 1, 2 ** 31, -2 ** 31 - 1, 2 ** 63,
                         -2 ** 63, 2 ** 100, 1.5, b'', b'x', b'(', b'\\', b'#c', b'\n', b'def', u'\xe9',
                         cycle, {}, {1: 2}, (), (1, b'x', 0, None), (300, None, 0, [(1, b'x', 0, None)] * 2),
@@ -369,6 +404,31 @@ class _World(object):
                 seen.add(id(n))
                 self.nodes.append(n)
                 stack.extend(n.fChildren or [])
+
+    def _HostileNodes(self):
+        """Python subclasses of node classes whose accessors misbehave."""
+        world = self
+
+        def Misbehave(values):
+            def Method(self, *args):
+                world.Mischief()
+                return world.rnd.choice(values + [world.Value()])
+            return Method
+        counts = [0, 1, 3, -1, 2 ** 62, -2 ** 63, 2 ** 63 - 1, 'x']
+        found = []
+        for base in (tl.CNode, tl.CExpression, tl.CAtom, tl.CTestListStarExpr, tl.CListmakerNode,
+                     tl.CFunctionParameterDef, tl.CExceptClause, tl.CFromImportStmt):
+            try:
+                cls = type('Hostile' + base.__name__, (base,), {
+                    'GetChildCount': Misbehave(counts), 'GetSubExprCount': Misbehave(counts),
+                    'GetChild': Misbehave([None]), 'GetSubExpr': Misbehave([None]),
+                    'GetChildText': Misbehave([b'(', b',', b'as', None])})
+            except TypeError:  # a final class
+                continue
+            node = cls(self.rnd.choice(self.infos))
+            node.__setstate__((self.rnd.sample(self.nodes, 3), self.rnd.choice(self.infos), 0, None, None))
+            found.append(node)
+        return found
 
     class _Converter(object):
         def __init__(self, world):

@@ -244,7 +244,7 @@ Py_ssize_t TestListStarExprOps::getSubExprCount(NodeObject *N) const {
                                  [&]() -> Py_ssize_t {
                                    if (testListIsGenExpr(N))
                                      return 0;
-                                   return (nodeGetChildCount(N) + 1) / 2;
+                                   return plus(nodeGetChildCount(N), 1) / 2;
                                  });
 }
 
@@ -252,7 +252,7 @@ PyObject *TestListStarExprOps::getSubExpr(NodeObject *N, Py_ssize_t I) const {
   return tl::guard<PyObject *>(nullptr, [&]() -> PyObject * {
     if (testListIsGenExpr(N))
       return Py_None;
-    Py_ssize_t J = 2 * I;
+    Py_ssize_t J = twice(I);
     if (J >= nodeGetChildCount(N))
       tl::raise(PyExc_ValueError, "Not enough expressions in list");
     NodeObject *Item = childAt(N, J);
@@ -417,14 +417,16 @@ Py_ssize_t ListmakerOps::getSubExprCount(NodeObject *N) const {
   return neverRaises<Py_ssize_t>("pysource.treelens.CListmakerNode.GetSubExprCount", 0, [&]() -> Py_ssize_t {
     if (isNodeOf(obj(childAt(N, 1)), C::CCompForNode))
       return 0;
-    return (nodeGetChildCount(N) - 1) / 2 + 1;
+    // An override may give any count: no overflow below.
+    Py_ssize_t Count = nodeGetChildCount(N);
+    return (Count == PY_SSIZE_T_MIN ? Count / 2 : (Count - 1) / 2) + 1;
   });
 }
 
 Ref ListmakerOps::getSubExpr(NodeObject *N, Py_ssize_t I) const {
   if (isNodeOf(obj(childAt(N, 1)), C::CCompForNode))
     return none();
-  Ref Item = nodeGetChild(N, 2 * I);
+  Ref Item = nodeGetChild(N, twice(I));
   if (Item.get() != Py_None && !isNodeOf(Item.get(), C::CExpression))
     raiseCannotConvert(Item.get(), nodeType(C::CExpression));
   return Item;

@@ -458,8 +458,7 @@ int initNodeTypes(PyObject *Module) {
     }
     PyTypeObject &Info = classInfoType();
     tl::registerPickle(cnodeType(),
-                       {{"fChildren", tl::FieldKind::Object, offsetof(NodeObject, Children), &PyList_Type,
-                         &cnodeType()},
+                       {{"fChildren", tl::FieldKind::Object, offsetof(NodeObject, Children), &PyList_Type},
                         {"fText", tl::FieldKind::Object, offsetof(NodeObject, Text), &PyString_Type},
                         {"fContext", tl::FieldKind::Object, offsetof(NodeObject, Context)},
                         {"fClsInfo", tl::FieldKind::Object, offsetof(NodeObject, ClsInfo), &Info},

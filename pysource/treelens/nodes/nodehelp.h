@@ -41,6 +41,15 @@ inline NodeObject *childAt(NodeObject *N, Py_ssize_t K) {
   return node(C);
 }
 
+/// Index arithmetic on caller-given indexes, saturating instead of
+/// overflowing: a saturated index is out of range either way.
+inline Py_ssize_t twice(Py_ssize_t I) {
+  return I > PY_SSIZE_T_MAX / 2 ? PY_SSIZE_T_MAX : I < PY_SSIZE_T_MIN / 2 ? PY_SSIZE_T_MIN : 2 * I;
+}
+inline Py_ssize_t plus(Py_ssize_t I, Py_ssize_t K) {
+  return I > PY_SSIZE_T_MAX - K ? PY_SSIZE_T_MAX : I + K;
+}
+
 /// Number of entries of N's children list, 0 for a leaf.
 inline Py_ssize_t rawCount(NodeObject *N) { return N->Children ? PyList_GET_SIZE(N->Children) : 0; }
 

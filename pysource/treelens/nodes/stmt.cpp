@@ -150,7 +150,7 @@ Ref ExceptClauseOps::getExceptionType(NodeObject *N) const { return nodeGetChild
 
 Ref ExceptClauseOps::getTarget(NodeObject *N) const {
   Py_ssize_t Count = nodeGetChildCount(N);
-  if (Count == 0 || Count - 2 < 1)
+  if (Count < 3)
     return none();
   Ref Sep = nodeGetChildText(N, Count - 2);
   if (textIs(Sep.get(), ",") || textIs(Sep.get(), "as"))
@@ -450,9 +450,9 @@ bool importStar(NodeObject *N) { return leafIs(childAt(N, -1), "*"); }
 
 Ref fromAsNameList(NodeObject *N) {
   Py_ssize_t I = fromImportGetImportIndex(N);
-  Ref Names = child(N, I + 1);
+  Ref Names = child(N, plus(I, 1));
   if (leafIs(node(Names.get()), "("))
-    Names = child(N, I + 2);
+    Names = child(N, plus(I, 2));
   return processAsNamesList(node(Names.get()));
 }
 

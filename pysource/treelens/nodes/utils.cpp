@@ -51,6 +51,8 @@ Py_ssize_t getTokenEndIndex(PyObject *Node) noexcept {
     Py_ssize_t Index = PyInt_AsSsize_t(Context);
     if (Index == -1 && PyErr_Occurred())
       throw tl::PyErrSet();
+    if (Index == PY_SSIZE_T_MAX)
+      tl::raise(PyExc_OverflowError, "token index too large");
     return Index + 1;
   });
 }

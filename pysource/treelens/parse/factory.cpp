@@ -84,6 +84,8 @@ int factory_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
     int NodeType = 0;
     while (PyObject *Item = PyIter_Next(Iter.get())) {
       Ref Cls = Ref::steal(Item);
+      if (NodeType > kMaxStateNumber)
+        tl::raise(PyExc_ValueError, "more node classes than grammar states");
       Ref Name = lookupEntry(Number2Symbol.get(), NodeType);
       if (!Name)
         Name = lookupEntry(TokNumber2Name, NodeType);

@@ -23,6 +23,10 @@ enum TokenCode : int {
   kBackslash = 203,
 };
 
+/// Grammar states (token types and symbol numbers) are numbered below this:
+/// the pgen engine's own bound on symbol numbers.
+constexpr long kMaxStateNumber = 256 + (1L << 20);
+
 /// Deepest level DiscardNodes descends to; deeper subtrees are released.
 constexpr int kMaxDiscardDepth = 100;
 

@@ -392,6 +392,9 @@ Ref buildClsForStateList(ParserObject *P) {
       throw tl::PyErrSet();
     Max = K > Max ? K : Max;
   }
+  // The grammar object may be the caller's: its numbers size the list.
+  if (Max > kMaxStateNumber)
+    tl::raiseFormat(PyExc_ValueError, "grammar symbol number out of range: %ld", Max);
   Ref Result = tl::require(PyList_New(0));
   for (long I = 0; I <= Max; ++I) {
     Ref Number = tl::require(PyInt_FromLong(I));
