@@ -20,6 +20,9 @@ namespace {
 
 PyTypeObject TypeHintWalkerType;
 
+/// False while a benchmark times full analysis without the hint walker.
+bool AnalyzerWalks = true;
+
 HW *self(PyObject *O) { return reinterpret_cast<HW *>(O); }
 
 /// The type's own method descriptor Name (borrowed).
@@ -169,6 +172,16 @@ PyMethodDef HintWalkerMethods[] = {
           "_AddSymInfo(name, istr, is_arg): appends one hint to the walked logical",
           addSymInfo(W, X[0], X[1], tl::isTrue(X[2]));
           return done()),
+    {"_SetAnalyzerWalks",
+     [](PyObject *, PyObject *Enabled) -> PyObject * {
+       return tl::guard<PyObject *>(nullptr, [&] {
+         AnalyzerWalks = tl::isTrue(Enabled);
+         return done().release();
+       });
+     },
+     METH_O | METH_STATIC,
+     "_SetAnalyzerWalks(enabled): whether analyzers run their hint walkers (for benchmarks that time "
+     "analysis without them)"},
     {nullptr, nullptr, 0, nullptr}};
 
 #define TL_MEMBER(Name, Type, Field, Doc)                                                                 \
@@ -186,6 +199,8 @@ PyMemberDef HintWalkerMembers[] = {
 PyTypeObject &typeHintWalkerType() { return TypeHintWalkerType; }
 
 void walk(PyObject *Walker, PyObject *Node, PyObject *Logical) {
+  if (!AnalyzerWalks)
+    return;
   if (!PyObject_TypeCheck(Walker, &TypeHintWalkerType))
     raiseCannotConvert(Walker, TypeHintWalkerType);
   hintWalk(self(Walker), Node, Logical);
