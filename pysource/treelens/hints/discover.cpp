@@ -129,7 +129,7 @@ std::pair<long, long> leafRows(LogicalLineObject *L, NodeObject *N) {
   if (I < 0)
     tl::raise(PyExc_IndexError, "tuple index out of range");
   long Row = L->Positions[I].Row;
-  return {Row, Row + lineCount(L->Texts[I])};
+  return {Row, Row + (L->Texts[I] ? lineCount(L->Texts[I]) : 0)};
 }
 
 /// The first (or last) leaf under Node, following first (or last) children.
