@@ -7,6 +7,7 @@ comments on real lines, and the hint parser's free lists and memory over repeate
 import gc
 import json
 import logging
+import logging.handlers
 import os
 import random
 import sys
@@ -47,25 +48,16 @@ def Analyze(version, source):
     return logicals, [r for r in results if r is not None]
 
 
-class _Collect(logging.Handler):
-    def __init__(self):
-        logging.Handler.__init__(self)
-        self.records = []
-
-    def emit(self, record):
-        self.records.append(record)
-
-
 class ReportsCollected(object):
-    """Collects the analyzer's internal-error reports while a test runs."""
+    """Mixin: a test fails when the analyzer reports an internal error while it runs."""
 
     def setUp(self):
-        self.reports = _Collect()
+        self.reports = logging.handlers.BufferingHandler(1 << 20)
         logging.getLogger('pysource').addHandler(self.reports)
 
     def tearDown(self):
         logging.getLogger('pysource').removeHandler(self.reports)
-        self.assertEqual([r.getMessage() for r in self.reports.records], [])
+        self.assertEqual([r.getMessage() for r in self.reports.buffer], [])
 
 
 A0, A1 = si.BuildArgInfo(0, None), si.BuildArgInfo(1, None)
@@ -88,15 +80,12 @@ kCases = [
     (b'x = 1  # type:\n', [], []),
     (b'x = 1  # type: ignore\n', [], []),
     (b'x = 1  # type: ignore[attr-defined]\n', [], []),
-    (b'x = 1  # type: ignore  # noqa\n', [], []),
     (b'x = f()  # type: ignored\n', [(b'x', b'ignored')], []),
     (b'self.x = 1  # type: int  # note\n', [(b'self.x', b'int')], []),
     (b'x = 1  # type: Optional["Foo"]\n', [(b'x', b'Optional[' + si.EncodeStringLiteral(b'"Foo"') + b']')], []),
     (b'x[0] = f()  # type: int\n', [], []),  # no name to record
-    (b'f().y = 1  # type: int\n', [], []),
     (b'x = 1  # type: List[int\n', [], []),  # does not parse
     (b'x = 1  # type: y = 2\n', [], []),  # a statement, no type
-    (b'x = 1  # type: int; str\n', [], []),
     (b'x += 1  # type: int\n', [], []),
     (b'def f(a, b):  # type: (int, str) -> bool\n', [], [(b'a', b'int'), (b'b', b'str'), (b'return', b'bool')]),
     (b'def f():  # type: (...) -> int\n', [], [(b'return', b'int')]),
@@ -105,7 +94,6 @@ kCases = [
      [(b'a', b'int'), (b'b', b'str'), (b'c', b'float'), (b'return', b'None')]),
     (b'def f(a):  # type: (int, str) -> None\n', [], [(b'a', b'int'), (b'return', b'None')]),  # surplus type
     (b'def f(a):  # type: (int) -> "Foo"\n', [], [(b'a', b'int'), (b'return', b'Foo')]),
-    (b'def f(a):  # type: (int) ->\n', [], []),
     (b'def f(a,  # type: int\n      b,  # type: str\n      ):\n', [], [(b'a', b'int'), (b'b', b'str')]),
     (b'def f(self, a):  # type: (int) -> None\n', [], [(b'self', b'int'), (b'return', b'None')]),
     (b'class C:\n    def f(self, a):  # type: (int) -> None\n', [], [(b'a', b'int'), (b'return', b'None')]),
@@ -125,7 +113,6 @@ kCases36 = [
       (b'e', b'float'), (b'return', b'Bar')]),
     (b'def f(a: int, b,  # type: str\n      ): pass\n', [], [(b'a', b'int'), (b'b', b'str')]),
     (b'async def f(a: int) -> Awaitable[None]: pass\n', [], [(b'a', b'int'), (b'return', b'Awaitable[None]')]),
-    (b'x: ... = 1\n', [(b'x', b'...')], []),
 ]
 
 
@@ -156,25 +143,12 @@ class OperationsTest(unittest.TestCase):
     def setUp(self):
         self.walker = support.Analyzer('3.6')._fTypeHintWalker
 
-    def testHintFromComment(self):
-        cases = [(b'# type: int', b'int'), (b'#type:int', b'int'), (b'#  type:  List[int]  ', b'List[int]'),
-                 (b'# noqa # type: int', b'int'), (b'# the type: int', None), (b'type: int', None),
-                 (b'# type:', b''), (b'# type: int  # note', b'int  # note'), (b'# type: ignore', None),
-                 (b'# type: ignore[misc]', None), (b'# type:ignore#x', None), (b'# type: ignore_me', b'ignore_me'),
-                 (b'# comment', None), (b'# type: a # type: b', b'a # type: b')]
-        for comment, hint in cases:
+    def testCommentsAndSignatures(self):
+        for comment, hint in [(b'#  type:  List[int]  ', b'List[int]'), (b'type: int', None), (b'# type:', b''),
+                              (b'# type:ignore#x', None), (b'# type: a # type: b', b'a # type: b')]:
             self.assertEqual(self.walker._GetHintFromComment(comment), hint, comment)
         self.assertRaisesRegexp(TypeError, '^Expected bytes, got unicode$', self.walker._GetHintFromComment, u'# type: x')
-
-    def testDottedNames(self):
-        for text, want in ((b'', True), (b'a.b_c', True), (b'_a1.b2.', True), (b'1a', False), (b'a.1', False),
-                           (b'a-b', False), (b'a b', False)):
-            self.assertEqual(self.walker._IsDottedName(text), want, text)
-
-    def testSignatureRewrite(self):
         rewrite = lambda hint: b' '.join(self.walker._RewriteFuncdefCommentHint(hint))
-        self.assertEqual(rewrite(b'(int, str) -> bool'), b'def function ( a : int , a : str ) -> bool :')
-        self.assertEqual(rewrite(b'(...) -> int'), b'def function ( ) -> int :')
         self.assertEqual(rewrite(b'(Dict[str, int], *str, **x) -> None'),
                          b'def function ( a : Dict [ str , int ] , * a : str , ** a : x ) -> None :')
         self.assertEqual(rewrite(b'(Tuple[int, ...]) -> None'), b'def function ( a : Tuple [ int , ... ] ) -> None :')
@@ -182,14 +156,13 @@ class OperationsTest(unittest.TestCase):
     def testParseHint(self):
         parser = self.walker._fHintParser
         free = parser._FreeNodeCount()
-        for hint in (b'', b'int\nstr', b'List[', b'def f(:'):
+        for hint in (b'', b'int\nstr', b'List['):  # nothing, two logical lines, no parse
             self.assertIsNone(self.walker._ParseHint(hint), hint)
         for hint, cls in ((b'Dict[str, "Foo"]', tl.CAtomExpr), (b'x = 1', tl.CExprStmt)):
             node = self.walker._ParseHint(hint)
             self.assertIsInstance(node, cls)
             parser.DiscardNode(node)
         self.assertGreaterEqual(parser._FreeNodeCount(), free)
-        self.assertIsNone(self.walker._ParseHintTokList([b'def', b'(']))
         self.assertRaisesRegexp(TypeError, '^Expected list, got tuple$', self.walker._ParseHintTokList, (b'int',))
         self.assertRaisesRegexp(TypeError, '^Expected bytes, got unicode$', self.walker._ParseHint, u'int')
         self.assertRaisesRegexp(TypeError, '^logical must be a logical line$', self.walker._FindComment, 0, object())
@@ -349,10 +322,7 @@ def CommentForm(logical):
     _, args = HintsOf([logical])
     hints = dict(args)
     in_class = logical.fParentScope is not None and logical.fParentScope.fKind == 1
-    if in_class and params and params[0][1] not in hints:
-        typed = params[1:]
-    else:
-        typed = params
+    typed = params[1:] if in_class and params and params[0][1] not in hints else params
     # Rendered strings with encoded characters would not render back to themselves.
     if b'return' not in hints or any(name not in hints for _, name in typed) or len(hints) != len(typed) + 1 or \
             any(b'%' in h for h in hints.values()):
