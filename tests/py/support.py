@@ -70,6 +70,24 @@ def CorpusFiles(version, limit=None, seed=1234):
     return files
 
 
+def StubFiles(limit=None, seed=1234):
+    """Sorted typeshed .pyi files fetched by tools/fetch-stubs.sh, sampled down to `limit` files.
+
+    The limit defaults to $TREELENS_STUB_LIMIT (0 for all), or 150 under the sanitizer build, or 1500.
+    """
+    root = os.environ.get('TREELENS_STUBS') or os.path.join(
+        os.environ.get('XDG_CACHE_HOME') or os.path.expanduser('~/.cache'), 'treelens', 'stubs')
+    files = []
+    for dirpath, dirnames, filenames in os.walk(os.path.join(root, 'typeshed-fallback')):
+        dirnames.sort()
+        files.extend(os.path.join(dirpath, n) for n in sorted(filenames) if n.endswith('.pyi'))
+    if limit is None:
+        limit = int(os.environ.get('TREELENS_STUB_LIMIT') or (150 if kSanitized else 1500))
+    if limit and len(files) > limit:
+        files = sorted(random.Random(seed).sample(files, limit))
+    return files
+
+
 def InAsyncDef(logical):
     """The host's rule (pysource.utils.InAsyncDef): inside an async def body, at any depth."""
     from pysource.utils import InAsyncDef as rule

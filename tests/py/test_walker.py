@@ -25,8 +25,9 @@ def Record(version, source, in_async_def=False):
     """(result, defined, reads, other equivs, args, arg equivs, bases) of the line."""
     result, L = support.AnalyzeLine(version, source, in_async_def)
     reads = set(n for n, i in L.fTypeEquivs if i == si.kGetPrefix)
-    others = [(n, i) for n, i in L.fTypeEquivs if i != si.kGetPrefix]
-    return result, L.fNamesDefined, reads, others, L.fArgNames, L.fArgTypeEquivs, L.fBaseClassNames
+    symbol = lambda pairs: [(n, i) for n, i in pairs if not i.startswith(si.kTypeHintPrefix)]  # hints: test_hints
+    others = [(n, i) for n, i in symbol(L.fTypeEquivs) if i != si.kGetPrefix]
+    return result, L.fNamesDefined, reads, others, L.fArgNames, symbol(L.fArgTypeEquivs), L.fBaseClassNames
 
 
 def Lit(kind, text=None):
