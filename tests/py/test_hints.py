@@ -19,6 +19,7 @@ try:
     from pysource import treelens as tl
     from pysource import symbolinfo as si
     from pysource import utils
+    from pysource import analysis
     sys.path.insert(0, os.path.join(support.kRoot, 'bench'))
     from treelens_bench import CompletedSource
 except ImportError as _exc:  # native modules not built
@@ -301,7 +302,7 @@ def Parse(logical, in_async_def=False):
 
 def Parser36():
     if not _kParsers:
-        _kParsers['3.6'] = tl.CPGenParserImpl((3, 6, 0), 'Python-Grammar-3.6', list(support.kPy3Keywords), True)
+        _kParsers['3.6'] = tl.CPGenParserImpl((3, 6, 0), 'Python-Grammar-3.6', list(analysis.kPy3Keywords), True)
     return _kParsers['3.6']
 
 
@@ -469,7 +470,7 @@ class RobustnessTest(ReportsCollected, unittest.TestCase):
         pieces = [b'(', b')', b'[', b']', b',', b'->', b'...', b'*', b'**', b'"', b"'x'", b'int', b'#', b'type:',
                   b'ignore', b'\\', b'lambda', b':', b'=', b'def', b'None', b'yield', b'{', b'}', b'\x00', b'\xff']
         analyzers = [support.Analyzer('2.7'), support.Analyzer('3.6'),
-                     tl.CPGenAnalyzerImpl((3, 7, 0), tl.kPy3DefaultGrammar, list(support.kPy3Keywords))]
+                     tl.CPGenAnalyzerImpl((3, 7, 0), tl.kPy3DefaultGrammar, list(analysis.kPy3Keywords))]
         for _ in range(rounds):
             hint = b''.join(rnd.choice(pieces) + rnd.choice([b'', b' ']) for _ in range(rnd.randrange(8)))
             if rnd.random() < 0.5:
