@@ -426,8 +426,9 @@ int initAnalyzerType(PyObject *Module) {
     tl::registerPickle(AnalyzerType,
                        {{"_fLogicalParser", F::Object, offsetof(AnalyzerObject, LogicalParser), &parserType()},
                         {"__GetTime", F::Object, offsetof(AnalyzerObject, GetTime)},
-                        {"_fNodeWalker", F::Object, offsetof(AnalyzerObject, NodeWalker)},
-                        {"_fTypeHintWalker", F::Object, offsetof(AnalyzerObject, TypeHintWalker)},
+                        {"_fNodeWalker", F::Object, offsetof(AnalyzerObject, NodeWalker), &walker::nodeWalkerType()},
+                        {"_fTypeHintWalker", F::Object, offsetof(AnalyzerObject, TypeHintWalker),
+                         &hints::typeHintWalkerType()},
                         {"_fFStringSupport", F::Object, offsetof(AnalyzerObject, FStringSupport),
                          &fstrings::fstringSupportType()}},
                        Host.UnpickleFields);

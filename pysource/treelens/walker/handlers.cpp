@@ -771,6 +771,7 @@ void visitAtomPlusTrailers(NW *W, PyObject *Atom, PyObject *AllTrailers) {
     NodeObject *T = asNodeOf(Trailer.get(), C::CTrailer);
     Ref Tok = trailerGetInitialToken(T);
     Ref Inner = ref(childAt(T, 1));
+    bool PlainBefore = Plain;
     Plain = Plain && Py_TYPE(Trailer.get()) == &nodeType(C::CTrailer) && rawCount(T) == 2 &&
             textIs(Tok.get(), ".") && Py_TYPE(Inner.get()) == NameType && node(Inner.get())->Text &&
             PyString_Check(node(Inner.get())->Text);
@@ -779,6 +780,10 @@ void visitAtomPlusTrailers(NW *W, PyObject *Atom, PyObject *AllTrailers) {
       Dotted.append(PyString_AS_STRING(node(Inner.get())->Text), PyString_GET_SIZE(node(Inner.get())->Text));
     }
     if (textIs(Tok.get(), "(") && rawCount(T) == 3) {
+      if (PlainBefore) { // the callee is the dotted name built so far
+        processFunctionCall(W, bytes(Dotted).get(), getUsedArgInfoList(Inner.get()).get());
+        continue;
+      }
       Ref Previous = tl::require(PyList_GetSlice(Trailers.get(), 0, I));
       visitCall(W, Atom, Previous.get(), Inner.get());
     } else if (textIs(Tok.get(), ".") && isNodeOf(Inner.get(), C::CNameLiteral)) {
@@ -817,6 +822,12 @@ void processFunctionCall(NW *W, PyObject *FuncName, PyObject *ArgList) {
     processIsInstanceCall(W, Args.get());
   if (FuncName == Py_None)
     return;
+  // Only calls with plain positional arguments are recorded: look before rendering any.
+  for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Args.get()); ++I) {
+    ArgInfoObject *A = asArgInfo(PyList_GET_ITEM(Args.get(), I));
+    if (A->Name || A->Prefix || !A->Value || A->Value == Py_None)
+      return;
+  }
   std::string Joined = "(";
   for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Args.get()); ++I) {
     ArgInfoObject *A = asArgInfo(PyList_GET_ITEM(Args.get(), I));
