@@ -163,11 +163,10 @@ PyObject *rec_SetLogicalLocalScopeDefined(PyObject *, PyObject *Args) {
     PyObject *Logical, *Name;
     if (!PyArg_ParseTuple(Args, "OO:SetLogicalLocalScopeDefined", &Logical, &Name))
       throw tl::PyErrSet();
-    LogicalLineObject *L = requireLogical(Logical);
-    PyObject *Old = L->LocalScopeDefined;
-    Py_INCREF(Name);
-    L->LocalScopeDefined = Name;
-    Py_XDECREF(Old);
+    requireLogical(Logical);
+    // Through the record's own setter, which keeps the record visible to the
+    // collector when it is given something other than a name.
+    tl::requireStatus(PyObject_SetAttrString(Logical, "fLocalScopeDefined", Name));
     Py_RETURN_NONE;
   });
 }
