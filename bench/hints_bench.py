@@ -10,34 +10,22 @@ annotated. Prints microseconds per logical line for both runs and the ratio.
 Usage: TREELENS_BUILD_DIR=<build> python2.7 bench/hints_bench.py [repeat] [file_limit]
 """
 
-import gc
 import os
 import sys
-import time
 
 sys.path.insert(0, os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
 
 from tests.py import support  # noqa: E402
-from pysource import treelens  # noqa: E402
+from pysource import analysis, treelens  # noqa: E402
 from pysource.utils import GetLogicalsFromText  # noqa: E402
+from treelens_bench import TimeTreelens  # noqa: E402  (bench/ is the script folder)
 
 
 def Best(analyzer, logicals, repeat, hint_walker):
     treelens.CTypeHintWalker._SetAnalyzerWalks(hint_walker)
     stdout, sys.stdout = sys.stdout, open(os.devnull, 'w')  # the walkers' limit reports
     try:
-        best = None
-        for _ in range(repeat):
-            for logical in logicals:
-                logical.fInspected = False
-            gc.collect()
-            analyze = analyzer.AnalyzeSingleLogical
-            start = time.time()
-            for logical in logicals:
-                analyze(logical, False)
-            elapsed = time.time() - start
-            best = elapsed if best is None else min(best, elapsed)
-        return best
+        return TimeTreelens(analyzer, logicals, repeat)
     finally:
         sys.stdout.close()
         sys.stdout = stdout
@@ -70,7 +58,7 @@ def main():
     limit = int(sys.argv[2]) if len(sys.argv) > 2 else None
     Report('2.7 standard library', treelens.CPGenAnalyzerImpl((2, 7, 0), treelens.kPy2DefaultGrammar, None, False),
            support.CorpusFiles('2.7', limit=limit), repeat)
-    Report('typeshed stubs', treelens.CPGenAnalyzerImpl((3, 6, 0), 'Python-Grammar-3.6', list(support.kPy3Keywords)),
+    Report('typeshed stubs', treelens.CPGenAnalyzerImpl((3, 6, 0), 'Python-Grammar-3.6', list(analysis.kPy3Keywords)),
            support.StubFiles(limit or 0), repeat)
 
 

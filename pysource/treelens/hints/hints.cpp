@@ -5,6 +5,7 @@
 #include "pysource/treelens/hints/hintsimpl.h"
 #include "pysource/treelens/nodes/nodehelp.h"
 #include "pysource/treelens/nodes/totext.h"
+#include "pysource/treelens/walker/methods.h"
 #include "typedesc.h"
 
 #include <structmember.h>
@@ -83,36 +84,9 @@ int hintWalkerClear(PyObject *Self) {
   return 0;
 }
 
-using Body = Ref (*)(HW *, PyObject *const *);
-
-/// Parses up to three object arguments and runs one operation.
-PyObject *runOp(PyObject *Self, PyObject *Args, PyObject *Kwds, const char *Format, const char *const *Keywords,
-                Body Run) {
-  return tl::guard<PyObject *>(nullptr, [&] {
-    PyObject *A[3] = {nullptr, nullptr, nullptr};
-    if (!PyArg_ParseTupleAndKeywords(Args, Kwds, Format, const_cast<char **>(Keywords), &A[0], &A[1], &A[2]))
-      throw tl::PyErrSet();
-    return Run(self(Self), A).release();
-  });
-}
-
-Ref done() { return Ref::borrow(Py_None); }
+using OpObject = HW;
+Ref done() { return walker::opDone(); }
 Ref boolean(bool B) { return Ref::borrow(B ? Py_True : Py_False); }
-
-#define TL_KEYWORDS(...)                                                                                  \
-  [] {                                                                                                    \
-    static const char *const List[] = {__VA_ARGS__, nullptr};                                             \
-    return List;                                                                                          \
-  }()
-
-#define TL_OP(PyName, Format, Keywords, Doc, Expr)                                                        \
-  {PyName,                                                                                                \
-   tl::kwFunction([](PyObject *S, PyObject *A, PyObject *Kw) -> PyObject * {                              \
-     return runOp(S, A, Kw, Format ":" PyName, Keywords, [](HW *W, PyObject *const *X) -> Ref { Expr; }); \
-   }),                                                                                                    \
-   METH_VARARGS | METH_KEYWORDS, Doc}
-
-#define TL_NODE_OP(PyName, Fn, Doc) TL_OP(PyName, "O", TL_KEYWORDS("node"), Doc, Fn(W, X[0]); return done())
 
 PyMethodDef HintWalkerMethods[] = {
     TL_OP("Walk", "OO", TL_KEYWORDS("node", "logical"),

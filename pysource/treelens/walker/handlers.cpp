@@ -177,6 +177,31 @@ Ref buildLiteralInfo(PyObject *Kind, PyObject *Text) {
   return concat({sym(Sym::kTypedLiteralPrefix), Kind, K.ColonBlank, Text});
 }
 
+/// Calls Record with "<class>" + kInstanceSuffix for the class a node names
+/// (`except E`, `isinstance(x, C)`), or for each dotted element of a tuple of
+/// classes (`(A, b.B)`); elements that are no dotted names are skipped.
+template <class F> void forEachInstanceInfo(NW *W, PyObject *Classes, F &&Record) {
+  PyObject *Suffix = PyDict_GetItemString(Host.ModuleDict, "kInstanceSuffix");
+  if (!Suffix)
+    tl::raise(PyExc_NameError, "global name 'kInstanceSuffix' is not defined");
+  Ref KeepSuffix = Ref::borrow(Suffix);
+  Ref ClassText = text(W, Classes, dottedOnly());
+  if (!isNone(ClassText)) {
+    Record(concat({ClassText.get(), Suffix}).get());
+    return;
+  }
+  Ref Elements = expandSeqLiteral(Classes, true);
+  if (isNone(Elements))
+    return;
+  asList(Elements.get());
+  for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Elements.get()); ++I) {
+    Ref Element = Ref::borrow(PyList_GET_ITEM(Elements.get(), I));
+    Ref ElementText = text(W, Element.get(), dottedOnly());
+    if (!isNone(ElementText))
+      Record(concat({ElementText.get(), Suffix}).get());
+  }
+}
+
 } // namespace
 
 void initWalkerConstants() {
@@ -706,25 +731,7 @@ void visitExceptClause(NW *W, PyObject *Node) {
     return;
   }
   processTargets(W, Target.get(), Py_None);
-  PyObject *Suffix = PyDict_GetItemString(Host.ModuleDict, "kInstanceSuffix");
-  if (!Suffix)
-    tl::raise(PyExc_NameError, "global name 'kInstanceSuffix' is not defined");
-  Ref Keep = Ref::borrow(Suffix);
-  Ref TypeText = text(W, Type.get(), dottedOnly());
-  if (!isNone(TypeText)) {
-    addNodeInfoStr(W, Target.get(), concat({TypeText.get(), Suffix}).get());
-    return;
-  }
-  Ref Elements = expandSeqLiteral(Type.get(), true);
-  if (isNone(Elements))
-    return;
-  asList(Elements.get());
-  for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Elements.get()); ++I) {
-    Ref Element = Ref::borrow(PyList_GET_ITEM(Elements.get(), I));
-    Ref ElementText = text(W, Element.get(), dottedOnly());
-    if (!isNone(ElementText))
-      addNodeInfoStr(W, Target.get(), concat({ElementText.get(), Suffix}).get());
-  }
+  forEachInstanceInfo(W, Type.get(), [&](PyObject *Info) { addNodeInfoStr(W, Target.get(), Info); });
 }
 
 void addNodeInfoStr(NW *W, PyObject *NameNode, PyObject *IStr) {
@@ -859,25 +866,7 @@ void processIsInstanceCall(NW *W, PyObject *ArgList) {
   Ref Name = text(W, Object.get(), dottedOnly());
   if (isNone(Name))
     return;
-  PyObject *Suffix = PyDict_GetItemString(Host.ModuleDict, "kInstanceSuffix");
-  if (!Suffix)
-    tl::raise(PyExc_NameError, "global name 'kInstanceSuffix' is not defined");
-  Ref KeepSuffix = Ref::borrow(Suffix);
-  Ref ClassText = text(W, Classes.get(), dottedOnly());
-  if (!isNone(ClassText)) {
-    recordTypeEquiv(W, Name.get(), concat({ClassText.get(), Suffix}).get());
-    return;
-  }
-  Ref Elements = expandSeqLiteral(Classes.get(), true);
-  if (isNone(Elements))
-    return;
-  asList(Elements.get());
-  for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Elements.get()); ++I) {
-    Ref Element = Ref::borrow(PyList_GET_ITEM(Elements.get(), I));
-    Ref ElementText = text(W, Element.get(), dottedOnly());
-    if (!isNone(ElementText))
-      recordTypeEquiv(W, Name.get(), concat({ElementText.get(), Suffix}).get());
-  }
+  forEachInstanceInfo(W, Classes.get(), [&](PyObject *Info) { recordTypeEquiv(W, Name.get(), Info); });
 }
 
 void appendSubscriptedEquivNode(NW *W, PyObject *NameNode, PyObject *EquivNode, Py_ssize_t Subscript) {

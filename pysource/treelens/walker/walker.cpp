@@ -7,6 +7,7 @@
 #include "pysource/treelens/host/host.h"
 #include "pysource/treelens/nodes/nodehelp.h"
 #include "pysource/treelens/nodes/totext.h"
+#include "pysource/treelens/walker/methods.h"
 #include "pysource/treelens/walker/walkerimpl.h"
 #include "typedesc.h"
 
@@ -464,36 +465,8 @@ int dispatchWalkerInit(PyObject *Self, PyObject *Args, PyObject *Kwds) {
   });
 }
 
-using Body = Ref (*)(NW *, PyObject *const *);
-
-/// Parses up to four object arguments and runs one operation of CNodeWalker.
-PyObject *runOp(PyObject *Self, PyObject *Args, PyObject *Kwds, const char *Format, const char *const *Keywords,
-                Body Run) {
-  return tl::guard<PyObject *>(nullptr, [&] {
-    PyObject *A[4] = {nullptr, nullptr, nullptr, nullptr};
-    if (!PyArg_ParseTupleAndKeywords(Args, Kwds, Format, const_cast<char **>(Keywords), &A[0], &A[1], &A[2], &A[3]))
-      throw tl::PyErrSet();
-    return Run(self(Self), A).release();
-  });
-}
-
-Ref done() { return Ref::borrow(Py_None); }
-
-#define TL_KEYWORDS(...)                                                                                  \
-  [] {                                                                                                    \
-    static const char *const List[] = {__VA_ARGS__, nullptr};                                             \
-    return List;                                                                                          \
-  }()
-
-#define TL_OP(PyName, Format, Keywords, Doc, Expr)                                                        \
-  {PyName,                                                                                                \
-   tl::kwFunction([](PyObject *S, PyObject *A, PyObject *Kw) -> PyObject * {                              \
-     return runOp(S, A, Kw, Format ":" PyName, Keywords, [](NW *W, PyObject *const *X) -> Ref { Expr; }); \
-   }),                                                                                                    \
-   METH_VARARGS | METH_KEYWORDS, Doc}
-
-/// A node argument of a visit operation.
-#define TL_NODE_OP(PyName, Fn, Doc) TL_OP(PyName, "O", TL_KEYWORDS("node"), Doc, Fn(W, X[0]); return done())
+using OpObject = NW;
+Ref done() { return opDone(); }
 
 bool flag(PyObject *O) { return O && tl::isTrue(O); }
 
