@@ -176,11 +176,12 @@ def TokenError(version, logical):
 class VersionAnalyzer(object):
     """Analyzes the logical lines of modules in one language version."""
 
-    def __init__(self, version):
+    def __init__(self, version, checks=True):
         if version not in kGrammars:
             raise ValueError('unknown version %r (expected one of %s)'
                              % (version, ', '.join(kVersions)))
         self.version = version
+        self.checks = bool(checks)
         self._triple, self._grammar, self._py3 = kGrammars[version]
         self._impls = {}
 
@@ -199,7 +200,7 @@ class VersionAnalyzer(object):
             else:
                 grammar, keywords = self._grammar, None
             impl = treelens.CPGenAnalyzerImpl(self._triple, grammar, keywords, self._py3,
-                                              kHintGrammar)
+                                              kHintGrammar, self.checks)
             self._impls[key] = impl
         return impl
 
@@ -238,19 +239,26 @@ class VersionAnalyzer(object):
 _gAnalyzers = {}
 
 
-def GetAnalyzer(version):
-    """The VersionAnalyzer of a version ('2.7', '3.5' or '3.6'), made once per process."""
-    analyzer = _gAnalyzers.get(version)
+def GetAnalyzer(version, checks=True):
+    """The VersionAnalyzer of a version ('2.7', '3.5' or '3.6'), made once per process.
+
+    With checks (the default) lines the grammar accepts are also checked as
+    CPython checks them after parsing (assignment targets, call arguments,
+    parameters, statements outside their block); without, only the grammar
+    and the lexical checks judge a line.
+    """
+    key = (version, bool(checks))
+    analyzer = _gAnalyzers.get(key)
     if analyzer is None:
-        analyzer = _gAnalyzers[version] = VersionAnalyzer(version)
+        analyzer = _gAnalyzers[key] = VersionAnalyzer(version, checks)
     return analyzer
 
 
-def _AnalyzeAuto(logicals):
+def _AnalyzeAuto(logicals, checks):
     """(version, errors) for 'auto': the newest version with no syntax error."""
     failed = None
     for version in kAutoOrder:
-        analyzer = GetAnalyzer(version)
+        analyzer = GetAnalyzer(version, checks)
         impl = analyzer.ImplFor(logicals)
         # The line that stopped the newer version usually stops this one too.
         if failed is not None and analyzer.AnalyzeLogical(impl, failed) is not None:
@@ -260,7 +268,7 @@ def _AnalyzeAuto(logicals):
             failed = logicals[len(errors) - 1]
             continue
         return version, errors
-    return kAutoOrder[0], GetAnalyzer(kAutoOrder[0]).Analyze(logicals)
+    return kAutoOrder[0], GetAnalyzer(kAutoOrder[0], checks).Analyze(logicals)
 
 
 class FileAnalysis(object):
@@ -350,11 +358,11 @@ def LineView(logical, error=None):
     return view
 
 
-def AnalyzeText(text, version=kAuto, path=None):
+def AnalyzeText(text, version=kAuto, path=None, checks=True):
     """Splits and analyzes a source text (bytes; unicode is encoded as UTF-8).
 
     Returns a FileAnalysis. A text with a NUL byte is not Python source: it is
-    not analyzed and its status is kUnreadable.
+    not analyzed and its status is kUnreadable. checks: as for GetAnalyzer.
     """
     if isinstance(text, unicode):
         text = text.encode('utf-8')
@@ -367,9 +375,9 @@ def AnalyzeText(text, version=kAuto, path=None):
                             % (line, column))
     logicals = utils.GetLogicalsFromText(text)
     if version == kAuto:
-        version, errors = _AnalyzeAuto(logicals)
+        version, errors = _AnalyzeAuto(logicals, checks)
     else:
-        errors = GetAnalyzer(version).Analyze(logicals)
+        errors = GetAnalyzer(version, checks).Analyze(logicals)
     failed = any(e is not None for e in errors)
     return FileAnalysis(path, version, logicals, errors, kSyntaxError if failed else kOk)
 
@@ -383,14 +391,14 @@ def ReadSource(path):
         return None, 'cannot read: %s' % (e.strerror or e)
 
 
-def AnalyzeFile(path, version=kAuto):
+def AnalyzeFile(path, version=kAuto, checks=True):
     """Reads and analyzes one file; never raises for I/O errors (status kUnreadable)."""
     if os.path.isdir(path):
         return FileAnalysis(path, status=kUnreadable, problem='cannot read: Is a directory')
     text, problem = ReadSource(path)
     if problem is not None:
         return FileAnalysis(path, status=kUnreadable, problem=problem)
-    return AnalyzeText(text, version, path)
+    return AnalyzeText(text, version, path, checks)
 
 
 def IterSourcePaths(paths):
@@ -439,7 +447,7 @@ def _WalkFolder(folder, seen, ancestors):
     ancestors.pop()
 
 
-def AnalyzeFolder(path, version=kAuto):
+def AnalyzeFolder(path, version=kAuto, checks=True):
     """Yields the FileAnalysis of every source file under a folder (or of a file), in order.
 
     Unreadable files and folders and symlink loops are yielded too, with
@@ -449,7 +457,7 @@ def AnalyzeFolder(path, version=kAuto):
         if problem is not None:
             yield FileAnalysis(found, status=status, problem=problem)
         else:
-            yield AnalyzeFile(found, version)
+            yield AnalyzeFile(found, version, checks)
 
 
 def WorstStatus(statuses):

@@ -2,6 +2,7 @@
 #include "pysource/treelens/front/front.h"
 
 #include "fieldpickle.h"
+#include "pysource/treelens/checks/checks.h"
 #include "pysource/treelens/fstrings/fstrings.h"
 #include "pysource/treelens/hints/hints.h"
 #include "pysource/treelens/host/host.h"
@@ -22,6 +23,7 @@ PyTypeObject AnalyzerType;
 /// kPy3DefaultGrammar as it was when the class was defined.
 PyObject *DefaultGrammar;
 PyObject *InvalidSyntax;
+PyObject *UnexpectedEOF;
 
 AnalyzerObject *self(PyObject *O) { return reinterpret_cast<AnalyzerObject *>(O); }
 
@@ -169,13 +171,14 @@ PyObject *analyzer_new(PyTypeObject *Type, PyObject *, PyObject *) {
 int analyzer_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
   return tl::guard<int>(-1, [&] {
     static const char *Keywords[] = {"version_triple", "grammar_file", "keyword_seq", "py3_grammar",
-                                     "hint_grammar_file", nullptr};
+                                     "hint_grammar_file", "syntax_checks", nullptr};
     PyObject *VersionTriple, *GrammarFile = DefaultGrammar, *KeywordSeq = Py_None, *Py3Grammar = Py_True,
-                             *HintGrammarFile = DefaultGrammar;
-    if (!PyArg_ParseTupleAndKeywords(Args, Kwds, "O|OOOO:CPGenAnalyzerImpl", const_cast<char **>(Keywords),
+                             *HintGrammarFile = DefaultGrammar, *SyntaxChecks = Py_False;
+    if (!PyArg_ParseTupleAndKeywords(Args, Kwds, "O|OOOOO:CPGenAnalyzerImpl", const_cast<char **>(Keywords),
                                      &VersionTriple, &GrammarFile, &KeywordSeq, &Py3Grammar,
-                                     &HintGrammarFile))
+                                     &HintGrammarFile, &SyntaxChecks))
       throw tl::PyErrSet();
+    bool Checks = tl::requireStatus(PyObject_IsTrue(SyntaxChecks)) != 0;
     AnalyzerObject *A = self(Self);
     Ref Parser = tl::require(PyObject_CallFunctionObjArgs(reinterpret_cast<PyObject *>(&parserType()),
                                                           VersionTriple, GrammarFile, KeywordSeq, Py3Grammar,
@@ -194,6 +197,7 @@ int analyzer_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
                    .release());
     Py_INCREF(Host.TimeTime);
     Py_XSETREF(A->GetTime, Host.TimeTime);
+    A->SyntaxChecks = Checks;
     return 0;
   });
 }
@@ -309,16 +313,42 @@ PyObject *orNone(PyObject *O) {
 }
 PyObject *analyzer_getNodeWalker(PyObject *Self, void *) { return orNone(self(Self)->NodeWalker); }
 PyObject *analyzer_getTypeHintWalker(PyObject *Self, void *) { return orNone(self(Self)->TypeHintWalker); }
+PyObject *analyzer_getSyntaxChecks(PyObject *Self, void *) { return PyBool_FromLong(self(Self)->SyntaxChecks); }
 
 PyGetSetDef AnalyzerGetSets[] = {
     {const_cast<char *>("_fNodeWalker"), analyzer_getNodeWalker, nullptr,
      const_cast<char *>("the symbol walker"), nullptr},
     {const_cast<char *>("_fTypeHintWalker"), analyzer_getTypeHintWalker, nullptr,
      const_cast<char *>("the type-hint walker"), nullptr},
+    {const_cast<char *>("fSyntaxChecks"), analyzer_getSyntaxChecks, nullptr,
+     const_cast<char *>("whether lines are also checked as CPython checks them after parsing"), nullptr},
     {nullptr, nullptr, nullptr, nullptr, nullptr}};
 
+/// Whether a logical ends inside brackets: the language's tokenizer then
+/// reaches the end of the file, and the parser says so.
+bool endsInBrackets(PyObject *Logical) {
+  auto *L = reinterpret_cast<host::LogicalLineObject *>(Logical);
+  long Depth = 0;
+  for (Py_ssize_t I = 0; I < L->TokenCount; ++I) {
+    switch (L->Types[I]) {
+    case 7: case 9: case 26: // ( [ {
+      ++Depth;
+      break;
+    case 8: case 10: case 27: // ) ] }
+      Depth = Depth > 0 ? Depth - 1 : 0;
+      break;
+    default:
+      break;
+    }
+  }
+  return Depth > 0;
+}
+
 /// The failure paths of AnalyzeSingleLogical, with an exception pending.
-Ref analysisFailed(PyObject *Logical) {
+/// With the syntax checks on, a line that fails at its end inside brackets
+/// gets CPython's message for that (CPython 2 only says so at the top level,
+/// where no block is left open).
+Ref analysisFailed(AnalyzerObject *A, PyObject *Logical) {
   if (PyErr_ExceptionMatches(Host.ParseError)) {
     FetchedError E;
     Ref Result = Ref::steal(tl::guard<PyObject *>(nullptr, [&] {
@@ -327,7 +357,12 @@ Ref analysisFailed(PyObject *Logical) {
       Py_ssize_t TokI = PyNumber_AsSsize_t(Context.get(), PyExc_OverflowError);
       if (TokI == -1 && PyErr_Occurred())
         throw tl::PyErrSet();
-      return createSyntaxError(InvalidSyntax, Logical, TokI).release();
+      PyObject *Msg = InvalidSyntax;
+      auto *L = reinterpret_cast<host::LogicalLineObject *>(Logical);
+      if (A->SyntaxChecks && TokI >= L->TokenCount && endsInBrackets(Logical) &&
+          (L->Indent == 0 || (A->LogicalParser && A->LogicalParser->Py3Grammar)))
+        Msg = UnexpectedEOF;
+      return createSyntaxError(Msg, Logical, TokI).release();
     }));
     if (Result)
       return Result;
@@ -360,7 +395,7 @@ Ref analyzeSingleLogical(AnalyzerObject *A, PyObject *Logical, bool InAsyncDef) 
     inspectSingleLogical(A, Logical, InAsyncDef, false);
     return true;
   });
-  return Ok ? Ref::borrow(Py_None) : analysisFailed(Logical);
+  return Ok ? Ref::borrow(Py_None) : analysisFailed(A, Logical);
 }
 
 void inspectSingleLogical(AnalyzerObject *A, PyObject *Logical, bool InAsyncDef, bool InFString) {
@@ -373,6 +408,8 @@ void inspectSingleLogical(AnalyzerObject *A, PyObject *Logical, bool InAsyncDef,
       return;
   }
   bool Ok = tl::guard<bool>(false, [&] {
+    if (A->SyntaxChecks)
+      checks::checkLine(A->LogicalParser, Tree.get(), Logical, InAsyncDef);
     walker::walk(A->NodeWalker, Tree.get(), Logical);
     hints::walk(A->TypeHintWalker, Tree.get(), Logical);
     if (!InFString)
@@ -407,6 +444,7 @@ int initAnalyzerType(PyObject *Module) {
   return tl::guard<int>(-1, [&] {
     DefaultGrammar = tl::require(PyObject_GetAttrString(Module, "kPy3DefaultGrammar")).release();
     InvalidSyntax = tl::internName("invalid syntax");
+    UnexpectedEOF = tl::internName("unexpected EOF while parsing");
     tl::TypeDesc D;
     D.Name = "pysource.treelens.CPGenAnalyzerImpl";
     D.Doc = "Analyzes logical using a parser implemented via the pgen2 package";
@@ -430,7 +468,8 @@ int initAnalyzerType(PyObject *Module) {
                         {"_fTypeHintWalker", F::Object, offsetof(AnalyzerObject, TypeHintWalker),
                          &hints::typeHintWalkerType()},
                         {"_fFStringSupport", F::Object, offsetof(AnalyzerObject, FStringSupport),
-                         &fstrings::fstringSupportType()}},
+                         &fstrings::fstringSupportType()},
+                        {"fSyntaxChecks", F::Bool, offsetof(AnalyzerObject, SyntaxChecks)}},
                        Host.UnpickleFields);
     return 0;
   });

@@ -14,6 +14,7 @@ struct AnalyzerObject {
   PyObject *NodeWalker;     ///< CNodeWalker
   PyObject *TypeHintWalker; ///< CTypeHintWalker
   PyObject *FStringSupport; ///< CFStringSupport
+  bool SyntaxChecks;        ///< also make CPython's checks after parsing (checks::checkLine)
 };
 
 /// CPGenAnalyzer, the abstract analyzer (base of CPGenParserImpl too).

@@ -1,0 +1,1642 @@
+// The checks CPython makes on a parsed statement before generating code, over
+// one line's parse tree. CPython finds these errors in three passes (building
+// the syntax tree, the symbol tables, the code) and reports the first error of
+// the earliest pass; each pass here keeps its first error in tree order.
+#include "pysource/treelens/checks/checks.h"
+
+#include "pysource/treelens/host/host.h"
+#include "pysource/treelens/nodes/node.h"
+
+#include <string.h>
+
+#include <string>
+#include <vector>
+
+namespace treelens {
+namespace checks {
+
+using tl::Ref;
+
+namespace {
+
+/// The grammar states and tokens the checks tell apart.
+enum class Sym : uint8_t {
+  Other,
+  // Tokens (leaves).
+  Name,
+  Number,
+  String,
+  Op,
+  Keyword,
+  // Grammar states.
+  Atom,
+  AtomExpr, // atom_expr and power
+  Trailer,
+  Arglist,
+  Argument,
+  TestlistComp, // testlist_comp and listmaker
+  DictOrSetMaker,
+  CompFor, // comp_for, list_for, old_comp_for
+  SyncCompFor,
+  Test, // conditional expression
+  OrAnd,
+  NotTest,
+  Comparison,
+  BinOp, // expr .. term
+  Factor,
+  Lambdef,
+  StarExpr,
+  YieldExpr,
+  Sequence, // testlist, exprlist, testlist_star_expr, testlist_safe, testlist1
+  ExprStmt,
+  AnnAssign,
+  DelStmt,
+  ReturnStmt,
+  ForStmt,
+  WhileStmt,
+  IfStmt,
+  TryStmt,
+  ExceptClause,
+  WithStmt,
+  WithItem,
+  Funcdef,
+  AsyncFuncdef,
+  AsyncStmt,
+  Classdef,
+  Parameters,
+  ArgsList, // typedargslist, varargslist
+  ParamDef, // tfpdef, vfpdef, fpdef
+  FpList,
+  GlobalStmt,
+  NonlocalStmt,
+  ImportName,
+  ImportFrom,
+  ImportAsName,
+  DottedAsName,
+  NameList, // import_as_names, dotted_as_names
+  Decorator,
+  Decorated,
+  SimpleStmt,
+  Suite,
+};
+
+struct SymName {
+  const char *Name;
+  Sym S;
+};
+
+const SymName SymNames[] = {
+    {"atom", Sym::Atom},
+    {"atom_expr", Sym::AtomExpr},
+    {"power", Sym::AtomExpr},
+    {"trailer", Sym::Trailer},
+    {"arglist", Sym::Arglist},
+    {"argument", Sym::Argument},
+    {"testlist_comp", Sym::TestlistComp},
+    {"listmaker", Sym::TestlistComp},
+    {"dictorsetmaker", Sym::DictOrSetMaker},
+    {"comp_for", Sym::CompFor},
+    {"list_for", Sym::CompFor},
+    {"old_comp_for", Sym::CompFor},
+    {"sync_comp_for", Sym::SyncCompFor},
+    {"test", Sym::Test},
+    {"or_test", Sym::OrAnd},
+    {"and_test", Sym::OrAnd},
+    {"not_test", Sym::NotTest},
+    {"comparison", Sym::Comparison},
+    {"expr", Sym::BinOp},
+    {"xor_expr", Sym::BinOp},
+    {"and_expr", Sym::BinOp},
+    {"shift_expr", Sym::BinOp},
+    {"arith_expr", Sym::BinOp},
+    {"term", Sym::BinOp},
+    {"factor", Sym::Factor},
+    {"lambdef", Sym::Lambdef},
+    {"lambdef_nocond", Sym::Lambdef},
+    {"old_lambdef", Sym::Lambdef},
+    {"star_expr", Sym::StarExpr},
+    {"yield_expr", Sym::YieldExpr},
+    {"testlist", Sym::Sequence},
+    {"exprlist", Sym::Sequence},
+    {"testlist_star_expr", Sym::Sequence},
+    {"testlist_safe", Sym::Sequence},
+    {"testlist1", Sym::Sequence},
+    {"expr_stmt", Sym::ExprStmt},
+    {"annassign", Sym::AnnAssign},
+    {"del_stmt", Sym::DelStmt},
+    {"return_stmt", Sym::ReturnStmt},
+    {"for_stmt", Sym::ForStmt},
+    {"while_stmt", Sym::WhileStmt},
+    {"if_stmt", Sym::IfStmt},
+    {"try_stmt", Sym::TryStmt},
+    {"except_clause", Sym::ExceptClause},
+    {"with_stmt", Sym::WithStmt},
+    {"with_item", Sym::WithItem},
+    {"funcdef", Sym::Funcdef},
+    {"async_funcdef", Sym::AsyncFuncdef},
+    {"async_stmt", Sym::AsyncStmt},
+    {"classdef", Sym::Classdef},
+    {"parameters", Sym::Parameters},
+    {"typedargslist", Sym::ArgsList},
+    {"varargslist", Sym::ArgsList},
+    {"tfpdef", Sym::ParamDef},
+    {"vfpdef", Sym::ParamDef},
+    {"fpdef", Sym::ParamDef},
+    {"fplist", Sym::FpList},
+    {"global_stmt", Sym::GlobalStmt},
+    {"nonlocal_stmt", Sym::NonlocalStmt},
+    {"import_name", Sym::ImportName},
+    {"import_from", Sym::ImportFrom},
+    {"import_as_name", Sym::ImportAsName},
+    {"import_as_names", Sym::NameList},
+    {"dotted_as_names", Sym::NameList},
+    {"decorators", Sym::Decorated},
+    {"dotted_as_name", Sym::DottedAsName},
+    {"decorator", Sym::Decorator},
+    {"decorated", Sym::Decorated},
+    {"simple_stmt", Sym::SimpleStmt},
+    {"suite", Sym::Suite},
+};
+
+/// State names seen so far and their Sym, by the name object (held, so that
+/// the address stays that name's). Direct-mapped: a collision just recomputes.
+struct SymCacheEntry {
+  PyObject *Name = nullptr;
+  Sym S = Sym::Other;
+};
+SymCacheEntry SymCache[512];
+
+Sym symOfName(const char *Name) {
+  for (const SymName &E : SymNames)
+    if (strcmp(E.Name, Name) == 0)
+      return E.S;
+  return Sym::Other;
+}
+
+/// Token codes of the leaves the checks look at.
+enum : int { kName = 1, kNumber = 2, kString = 3, kEllipsis = 52, kAwait = 53, kAsync = 54 };
+
+using N = NodeObject;
+
+inline bool isLeaf(N *X) { return X->Children == nullptr; }
+inline Py_ssize_t count(N *X) { return X->Children ? PyList_GET_SIZE(X->Children) : 0; }
+inline N *child(N *X, Py_ssize_t I) { return reinterpret_cast<N *>(PyList_GET_ITEM(X->Children, I)); }
+
+/// The leaf's text ("" when it has none).
+inline const char *text(N *X) { return X->Text && PyString_Check(X->Text) ? PyString_AS_STRING(X->Text) : ""; }
+inline bool textIs(N *X, const char *T) { return isLeaf(X) && strcmp(text(X), T) == 0; }
+
+Sym symOf(N *X) {
+  ClassInfoObject *Info = X->ClsInfo;
+  if (!Info)
+    return Sym::Other;
+  if (isLeaf(X)) {
+    switch (Info->NodeType) {
+    case kName:
+      return Py_TYPE(X) == &nodeType(NodeClass::CKeywordLiteral) ? Sym::Keyword : Sym::Name;
+    case kNumber:
+      return Sym::Number;
+    case kString:
+      return Sym::String;
+    case kAwait:
+    case kAsync:
+      return Sym::Keyword;
+    default:
+      return Sym::Op;
+    }
+  }
+  PyObject *Name = Info->Name;
+  if (!Name || !PyString_Check(Name))
+    return Sym::Other;
+  SymCacheEntry &E = SymCache[(reinterpret_cast<uintptr_t>(Name) >> 4) % 512];
+  if (E.Name != Name) {
+    Py_INCREF(Name);
+    Py_XSETREF(E.Name, Name);
+    E.S = symOfName(PyString_AS_STRING(Name));
+  }
+  return E.S;
+}
+
+/// First leaf of a subtree (its token index locates the subtree).
+N *firstLeaf(N *X) {
+  while (!isLeaf(X) && count(X) > 0)
+    X = child(X, 0);
+  return X;
+}
+
+/// The await keyword (a plain name where the version has no such keyword).
+inline bool isAwait(N *X) {
+  return textIs(X, "await") && X->ClsInfo &&
+         (X->ClsInfo->NodeType == kAwait || Py_TYPE(X) == &nodeType(NodeClass::CKeywordLiteral));
+}
+
+/// The expression inside grouping parentheses: (x) is x, but (x,), (x for
+/// x in y) and (yield) are expressions of their own.
+N *strip(N *X) {
+  while (!isLeaf(X) && count(X) == 3 && symOf(X) == Sym::Atom && textIs(child(X, 0), "(")) {
+    N *In = child(X, 1);
+    Sym S = symOf(In);
+    if (S == Sym::TestlistComp || S == Sym::YieldExpr || textIs(In, "yield"))
+      break;
+    X = In;
+  }
+  return X;
+}
+
+/// What a subtree becomes in CPython's syntax tree, as far as the checks care.
+enum class Kind : uint8_t {
+  Name,
+  NameConstant, // None, True, False under Python 3
+  Attribute,
+  Subscript,
+  Starred,
+  List,
+  Tuple,
+  EmptyTuple,
+  Call,
+  Operator,
+  GeneratorExp,
+  Yield,
+  Await,
+  ListComp,
+  SetComp,
+  DictComp,
+  Literal, // numbers, strings, dicts and sets
+  Ellipsis,
+  Compare,
+  IfExp,
+  Lambda,
+  Repr,
+  Other,
+};
+
+/// Which pass of CPython's finds an error.
+enum Pass : int { kParse, kAst, kFuture, kSymtable, kCompile, kPassCount };
+
+/// The kinds of block a statement can sit in.
+enum class Block : uint8_t { Module, Class, Function, AsyncFunction, Lambda, Comprehension };
+
+struct Scope {
+  Block B;
+  const Scope *Outer;               ///< nullptr at the line's outermost scope
+  bool InLoop = false;               ///< a loop of this line encloses the statement
+  bool NoLoop = false;               ///< no loop can enclose it (a fresh scope or the module's top level)
+  bool InFinally = false;            ///< directly in a finally clause of this line
+  std::vector<std::string> *Params = nullptr; ///< parameter names of a def or lambda of this line
+  const char *Comprehension = nullptr;         ///< what a comprehension scope builds
+};
+
+struct Found {
+  bool Set = false;
+  std::string Msg;
+  Py_ssize_t TokI = 0;
+  int ColDelta = 0; ///< added to the column of the token (the parser's errors point past a token)
+};
+
+class Checker {
+public:
+  Checker(ParserObject *P, PyObject *Logical)
+      : Logical(Logical), L(reinterpret_cast<host::LogicalLineObject *>(Logical)) {
+    Py3 = P->Py3Grammar;
+    Minor = 0;
+    if (P->VersionTriple && PyTuple_Check(P->VersionTriple) && PyTuple_GET_SIZE(P->VersionTriple) >= 2) {
+      long M = PyInt_AsLong(PyTuple_GET_ITEM(P->VersionTriple, 1));
+      if (M == -1 && PyErr_Occurred())
+        PyErr_Clear();
+      else
+        Minor = static_cast<int>(M);
+    }
+  }
+
+  void run(N *Tree);
+
+private:
+  PyObject *Logical;
+  host::LogicalLineObject *L;
+  bool Py3;
+  int Depth = 0;
+  int Minor;
+  Found First[kPassCount];
+
+  void report(Pass P, N *At, std::string Msg, int ColDelta = 0) {
+    if (First[P].Set)
+      return;
+    First[P].Set = true;
+    First[P].Msg = std::move(Msg);
+    N *Leaf = firstLeaf(At);
+    long I = Leaf->Context && PyInt_Check(Leaf->Context) ? PyInt_AS_LONG(Leaf->Context) : 0;
+    First[P].TokI = I;
+    First[P].ColDelta = ColDelta;
+  }
+  void raise();
+
+  // Statements.
+  void stmt(N *X, const Scope &S);
+  void suite(N *X, const Scope &S) { stmt(X, S); }
+  void exprStmt(N *X, const Scope &S);
+  void annAssign(N *Target, N *Ann, const Scope &S);
+  void forStmt(N *X, const Scope &S, bool Async);
+  void whileStmt(N *X, const Scope &S);
+  void ifStmt(N *X, const Scope &S);
+  void tryStmt(N *X, const Scope &S);
+  void withStmt(N *X, const Scope &S, bool Async);
+  void funcdef(N *X, const Scope &S, bool Async, N *At);
+  void classdef(N *X, const Scope &S);
+  void importStmt(N *X, const Scope &S, bool Top);
+  void futureImport(N *X, Py_ssize_t Names, bool Top);
+  void namesStmt(N *X, const Scope &S, bool Nonlocal);
+  void scopeStmt(N *X, const Scope &S, const char *Word);
+
+  // Expressions.
+  void load(N *X, const Scope &S);
+  void elements(N *X, const Scope &S, bool StarOk);
+  void atom(N *X, const Scope &S);
+  void atomExpr(N *X, const Scope &S);
+  void call(N *Args, const Scope &S);
+  void comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict);
+  void lambdef(N *X, const Scope &S);
+  void yieldExpr(N *X, const Scope &S);
+  void starred(N *X, const Scope &S);
+
+  // Targets.
+  Kind kindOf(N *X);
+  void target(N *X, bool Del, N *Loc, const Scope &S);
+  void setContext(N *X, bool Del, N *Loc);
+  void exprlistTargets(N *X, bool Del, const Scope &S);
+  void storeName(N *NameLeaf, N *Loc, bool FullChecks);
+  void countStars(N *X, bool Top);
+
+  // Parameters.
+  void parameters(N *X, const Scope &S, std::vector<std::string> &Names, N *Owner);
+  void paramNames(N *X, std::vector<std::string> &Names);
+
+  Scope initialScope();
+  static const Scope *function(const Scope &S);
+};
+
+// ---- the scope chain ----
+
+Scope Checker::initialScope() {
+  Scope S{Block::Module, nullptr};
+  PyObject *Parent = L->ParentScope;
+  if (Parent && host::isLogical(Parent)) {
+    auto *P = reinterpret_cast<host::LogicalLineObject *>(Parent);
+    if (P->Kind == 1) {
+      S.B = Block::Class;
+    } else if (P->Kind == 2) {
+      bool Async = P->TokenCount > 0 && P->Texts[0] && PyString_Check(P->Texts[0]) &&
+                   strcmp(PyString_AS_STRING(P->Texts[0]), "async") == 0;
+      S.B = Async ? Block::AsyncFunction : Block::Function;
+    }
+  } else {
+    // Only a statement at the module's top level is known to be in no loop.
+    S.NoLoop = L->Indent == 0;
+  }
+  return S;
+}
+
+/// The innermost def, lambda or comprehension scope, or nullptr.
+const Scope *Checker::function(const Scope &S) {
+  for (const Scope *P = &S; P; P = P->Outer)
+    if (P->B != Block::Module && P->B != Block::Class)
+      return P;
+  return nullptr;
+}
+
+/// Whether a def encloses the statement in the file: a scope of this line, or
+/// the record's chain above its innermost def or class.
+bool enclosingFunctionBeyond(PyObject *Logical, bool SkipInnermost) {
+  auto *L = reinterpret_cast<host::LogicalLineObject *>(Logical);
+  PyObject *Parent = L->ParentScope;
+  bool Skip = SkipInnermost;
+  for (int Steps = 0; Parent && host::isLogical(Parent) && Steps < 1000; ++Steps) {
+    auto *P = reinterpret_cast<host::LogicalLineObject *>(Parent);
+    if (P->Kind == 2) {
+      if (!Skip)
+        return true;
+    }
+    Skip = false;
+    Parent = P->ParentScope;
+  }
+  return false;
+}
+
+// ---- statements ----
+
+void Checker::run(N *Tree) {
+  Scope S = initialScope();
+  stmt(Tree, S);
+  raise();
+}
+
+/// Bounds the recursion: subtrees nested deeper than this are not checked.
+constexpr int kMaxDepth = 300;
+
+struct Deeper {
+  int &D;
+  explicit Deeper(int &D) : D(D) { ++D; }
+  ~Deeper() { --D; }
+};
+
+void Checker::stmt(N *X, const Scope &S) {
+  Deeper Guard(Depth);
+  if (Depth > kMaxDepth)
+    return;
+  switch (symOf(X)) {
+  case Sym::SimpleStmt:
+  case Sym::Suite:
+    for (Py_ssize_t I = 0; I < count(X); ++I) {
+      N *C = child(X, I);
+      if (symOf(C) == Sym::ImportFrom)
+        importStmt(C, S, Depth == 1 && I == 0 && !S.Outer);
+      else if (!isLeaf(C) || symOf(C) == Sym::Keyword || symOf(C) == Sym::Name)
+        stmt(C, S);
+    }
+    return;
+  case Sym::ExprStmt:
+    return exprStmt(X, S);
+  case Sym::DelStmt:
+    return exprlistTargets(child(X, 1), true, S);
+  case Sym::ReturnStmt:
+    scopeStmt(X, S, "return");
+    for (Py_ssize_t I = 1; I < count(X); ++I)
+      load(child(X, I), S);
+    return;
+  case Sym::ForStmt:
+    return forStmt(X, S, false);
+  case Sym::WhileStmt:
+    return whileStmt(X, S);
+  case Sym::IfStmt:
+    return ifStmt(X, S);
+  case Sym::TryStmt:
+    return tryStmt(X, S);
+  case Sym::WithStmt:
+    return withStmt(X, S, false);
+  case Sym::Funcdef:
+    return funcdef(X, S, false, X);
+  case Sym::AsyncFuncdef:
+    return funcdef(child(X, 1), S, true, X);
+  case Sym::AsyncStmt: {
+    N *Inner = count(X) > 1 ? child(X, 1) : X;
+    switch (symOf(Inner)) {
+    case Sym::Funcdef:
+      return funcdef(Inner, S, true, X);
+    case Sym::ForStmt:
+    case Sym::WithStmt: {
+      if (S.B != Block::AsyncFunction)
+        report(kCompile, X, symOf(Inner) == Sym::ForStmt ? "'async for' outside async function"
+                                                         : "'async with' outside async function");
+      return symOf(Inner) == Sym::ForStmt ? forStmt(Inner, S, true) : withStmt(Inner, S, true);
+    }
+    default:
+      return;
+    }
+  }
+  case Sym::Classdef:
+    return classdef(X, S);
+  case Sym::Decorated:
+    for (Py_ssize_t I = 0; I < count(X); ++I)
+      stmt(child(X, I), S);
+    return;
+  case Sym::Decorator:
+    // '@' dotted_name ['(' [arglist] ')'] NEWLINE
+    if (count(X) >= 5 && textIs(child(X, 2), "(") && !textIs(child(X, 3), ")"))
+      call(child(X, 3), S);
+    return;
+  case Sym::ImportName:
+  case Sym::ImportFrom:
+    return importStmt(X, S, Depth == 1 && !S.Outer);
+  case Sym::GlobalStmt:
+    return namesStmt(X, S, false);
+  case Sym::NonlocalStmt:
+    return namesStmt(X, S, true);
+  case Sym::Keyword:
+    if (textIs(X, "return") || textIs(X, "break") || textIs(X, "continue"))
+      return scopeStmt(X, S, text(X));
+    if (textIs(X, "yield"))
+      return yieldExpr(X, S);
+    return;
+  case Sym::StarExpr:
+    starred(X, S);
+    return load(child(X, 1), S);
+  case Sym::Other:
+    if (!isLeaf(X)) {
+      // break_stmt and the like are promoted to their keyword; other statements
+      // (raise, assert, print, exec, decorators) only hold expressions.
+      for (Py_ssize_t I = 0; I < count(X); ++I)
+        load(child(X, I), S);
+    }
+    return;
+  default:
+    // An expression statement.
+    return load(X, S);
+  }
+}
+
+/// return, break and continue: the block they need.
+void Checker::scopeStmt(N *X, const Scope &S, const char *Word) {
+  if (strcmp(Word, "return") == 0) {
+    // Only the innermost scope counts: a class in a def is no function.
+    if (S.B == Block::Module || S.B == Block::Class)
+      report(kCompile, X, "'return' outside function");
+    return;
+  }
+  bool Break = strcmp(Word, "break") == 0;
+  if (S.InLoop)
+    return;
+  if (!Break && S.InFinally && (!Py3 || Minor < 8)) {
+    report(kCompile, X, "'continue' not supported inside 'finally' clause");
+    return;
+  }
+  if (S.NoLoop)
+    report(kCompile, X, Break ? "'break' outside loop" : "'continue' not properly in loop");
+}
+
+void Checker::exprStmt(N *X, const Scope &S) {
+  Py_ssize_t Count = count(X);
+  if (Count >= 2 && symOf(child(X, 1)) == Sym::AnnAssign)
+    return annAssign(child(X, 0), child(X, 1), S);
+  if (Count == 3 && symOf(child(X, 1)) == Sym::Op && !textIs(child(X, 1), "=")) {
+    // Augmented assignment: the target must be a name, attribute or subscript.
+    N *T = child(X, 0);
+    load(T, S);
+    setContext(T, false, T);
+    Kind K = kindOf(T);
+    if (K != Kind::Name && K != Kind::Attribute && K != Kind::Subscript)
+      report(kAst, T, "illegal expression for augmented assignment");
+    load(child(X, 2), S);
+    return;
+  }
+  for (Py_ssize_t I = 0; I + 2 < Count; I += 2) {
+    N *T = child(X, I);
+    Sym TS = symOf(T);
+    if (TS == Sym::YieldExpr || textIs(T, "yield")) {
+      report(kAst, T, "assignment to yield expression not possible");
+      yieldExpr(T, S);
+      continue;
+    }
+    target(T, false, T, S);
+  }
+  load(child(X, Count - 1), S);
+}
+
+void Checker::annAssign(N *T, N *Ann, const Scope &S) {
+  load(T, S);
+  N *E = strip(T);
+  switch (kindOf(T)) {
+  case Kind::Name:
+    if (strcmp(text(E), "__debug__") == 0)
+      report(kAst, T, "assignment to keyword");
+    break;
+  case Kind::Attribute: {
+    N *Last = child(E, count(E) - 1);
+    if (count(Last) == 2 && strcmp(text(child(Last, 1)), "__debug__") == 0)
+      report(kAst, T, "assignment to keyword");
+    break;
+  }
+  case Kind::Subscript:
+    break;
+  case Kind::List:
+    report(kAst, T, "only single target (not list) can be annotated");
+    break;
+  case Kind::Tuple:
+  case Kind::EmptyTuple:
+    report(kAst, T, "only single target (not tuple) can be annotated");
+    break;
+  default:
+    report(kAst, T, "illegal target for annotation");
+    break;
+  }
+  // ':' test ['=' test]
+  for (Py_ssize_t I = 1; I < count(Ann); I += 2)
+    load(child(Ann, I), S);
+}
+
+void Checker::forStmt(N *X, const Scope &S, bool) {
+  // 'for' exprlist 'in' testlist ':' suite ['else' ':' suite]
+  if (count(X) < 6)
+    return;
+  exprlistTargets(child(X, 1), false, S);
+  load(child(X, 3), S);
+  Scope Body = S;
+  Body.InLoop = true;
+  Body.InFinally = false;
+  suite(child(X, 5), Body);
+  if (count(X) >= 9)
+    suite(child(X, 8), S);
+}
+
+void Checker::whileStmt(N *X, const Scope &S) {
+  if (count(X) < 4)
+    return;
+  load(child(X, 1), S);
+  Scope Body = S;
+  Body.InLoop = true;
+  Body.InFinally = false;
+  suite(child(X, 3), Body);
+  if (count(X) >= 7)
+    suite(child(X, 6), S);
+}
+
+void Checker::ifStmt(N *X, const Scope &S) {
+  for (Py_ssize_t I = 0; I < count(X); ++I) {
+    N *C = child(X, I);
+    if (textIs(C, "if") || textIs(C, "elif")) {
+      if (I + 1 < count(X))
+        load(child(X, I + 1), S);
+      ++I;
+    } else if (!textIs(C, ":") && !textIs(C, "else")) {
+      suite(C, S);
+    }
+  }
+}
+
+void Checker::tryStmt(N *X, const Scope &S) {
+  for (Py_ssize_t I = 0; I + 2 < count(X); ++I) {
+    N *C = child(X, I);
+    if (!textIs(child(X, I + 1), ":"))
+      continue;
+    N *Body = child(X, I + 2);
+    Scope BS = S;
+    if (symOf(C) == Sym::ExceptClause) {
+      // 'except' [test [('as' | ',') test]]
+      if (count(C) >= 2)
+        load(child(C, 1), S);
+      if (count(C) >= 4) {
+        N *T = child(C, 3);
+        if (Py3)
+          storeName(T, T, false);
+        else
+          target(T, false, T, S);
+      }
+    } else if (textIs(C, "finally")) {
+      BS.InFinally = true;
+    }
+    suite(Body, BS);
+    I += 2;
+  }
+}
+
+void Checker::withStmt(N *X, const Scope &S, bool) {
+  for (Py_ssize_t I = 1; I < count(X); ++I) {
+    N *C = child(X, I);
+    if (textIs(C, ",") )
+      continue;
+    if (textIs(C, ":")) {
+      if (I + 1 < count(X))
+        suite(child(X, I + 1), S);
+      return;
+    }
+    if (symOf(C) == Sym::WithItem && count(C) == 3) {
+      load(child(C, 0), S);
+      target(child(C, 2), false, C, S);
+    } else {
+      load(C, S);
+    }
+  }
+}
+
+void Checker::funcdef(N *X, const Scope &S, bool Async, N *At) {
+  // 'def' NAME parameters ['->' test] ':' suite
+  if (count(X) < 5)
+    return;
+  storeName(child(X, 1), child(X, 1), false);
+  std::vector<std::string> Names;
+  N *Params = child(X, 2);
+  parameters(Params, S, Names, At);
+  Py_ssize_t I = 3;
+  if (textIs(child(X, I), "->")) {
+    load(child(X, I + 1), S);
+    I += 2;
+  }
+  Scope Body{Async ? Block::AsyncFunction : Block::Function, &S};
+  Body.NoLoop = true;
+  Body.Params = &Names;
+  if (I + 1 < count(X))
+    suite(child(X, I + 1), Body);
+}
+
+void Checker::classdef(N *X, const Scope &S) {
+  // 'class' NAME ['(' [arglist] ')'] ':' suite
+  if (count(X) < 4)
+    return;
+  storeName(child(X, 1), child(X, 3), false);
+  Py_ssize_t I = 2;
+  if (textIs(child(X, 2), "(")) {
+    if (!textIs(child(X, 3), ")")) {
+      if (Py3)
+        call(child(X, 3), S);
+      else
+        load(child(X, 3), S);
+    }
+    while (I < count(X) && !textIs(child(X, I), ":"))
+      ++I;
+  }
+  Scope Body{Block::Class, &S};
+  Body.NoLoop = true;
+  if (I + 1 < count(X))
+    suite(child(X, I + 1), Body);
+}
+
+void Checker::importStmt(N *X, const Scope &S, bool Top) {
+  // The names a statement binds: 'as' names, and names without a dot.
+  auto bound = [&](N *Item) {
+    Sym IS = symOf(Item);
+    if (IS == Sym::Name || IS == Sym::Keyword)
+      storeName(Item, Item, false);
+    else if ((IS == Sym::ImportAsName || IS == Sym::DottedAsName) && count(Item) == 3)
+      storeName(child(Item, 2), child(Item, 2), false);
+  };
+  auto names = [&](N *List) {
+    if (symOf(List) != Sym::NameList)
+      return bound(List);
+    for (Py_ssize_t I = 0; I < count(List); I += 2)
+      bound(child(List, I));
+  };
+  if (symOf(X) == Sym::ImportName) {
+    if (count(X) == 2)
+      names(child(X, 1));
+    return;
+  }
+  // 'from' module 'import' ('*' | '(' names ')' | names)
+  for (Py_ssize_t I = 1; I + 1 < count(X); ++I) {
+    if (!textIs(child(X, I), "import"))
+      continue;
+    N *What = child(X, I + 1);
+    if (I == 2 && textIs(child(X, 1), "__future__"))
+      futureImport(X, I + 1, Top && L->Indent == 0 && !(L->ParentScope && host::isLogical(L->ParentScope)));
+    if (textIs(What, "*")) {
+      if (Py3 && S.B != Block::Module)
+        report(kSymtable, X, "import * only allowed at module level");
+    } else if (textIs(What, "(")) {
+      if (I + 2 < count(X))
+        names(child(X, I + 2));
+    } else {
+      if (symOf(What) == Sym::NameList && textIs(child(What, count(What) - 1), ","))
+        report(kAst, What, "trailing comma not allowed without surrounding parentheses");
+      names(What);
+    }
+    return;
+  }
+}
+
+/// from __future__ import: only first in the file, and only known features.
+void Checker::futureImport(N *X, Py_ssize_t Names, bool Top) {
+  if (!Top) {
+    // Not at the module's top level: past the beginning of the file.
+    report(kCompile, X, "from __future__ imports must occur at the beginning of the file");
+    return;
+  }
+  static const char *const Features[] = {"nested_scopes", "generators",      "division",       "absolute_import",
+                                         "with_statement", "print_function", "unicode_literals", nullptr};
+  static const char *const Py3Features[] = {"barry_as_FLUFL", "generator_stop", nullptr};
+  std::vector<N *> Items;
+  N *What = child(X, Names);
+  if (textIs(What, "(") && Names + 1 < count(X))
+    What = child(X, Names + 1);
+  if (symOf(What) == Sym::NameList) {
+    for (Py_ssize_t I = 0; I < count(What); I += 2)
+      Items.push_back(child(What, I));
+  } else {
+    Items.push_back(What);
+  }
+  for (N *Item : Items) {
+    N *Feature = isLeaf(Item) ? Item : child(Item, 0);
+    const char *Name = text(Feature);
+    bool Known = false;
+    for (const char *const *F = Features; *F; ++F)
+      Known = Known || strcmp(*F, Name) == 0;
+    for (const char *const *F = Py3Features; Py3 && *F; ++F)
+      Known = Known || strcmp(*F, Name) == 0;
+    Known = Known || (Py3 && Minor >= 7 && strcmp(Name, "annotations") == 0);
+    if (Known)
+      continue;
+    if (strcmp(Name, "braces") == 0)
+      report(kFuture, X, "not a chance");
+    else
+      report(kFuture, X, std::string("future feature ") + Name + " is not defined");
+    return;
+  }
+}
+
+void Checker::namesStmt(N *X, const Scope &S, bool Nonlocal) {
+  const Scope *F = function(S);
+  for (Py_ssize_t I = 1; I < count(X); I += 2) {
+    N *Name = child(X, I);
+    if (F && F->Params && F == &S) {
+      for (const std::string &P : *F->Params) {
+        if (P == text(Name)) {
+          std::string Msg = std::string("name '") + text(Name) + "' is " +
+                            (Py3 ? "parameter" : "local") + " and " + (Nonlocal ? "nonlocal" : "global");
+          report(kSymtable, X, Msg);
+          return;
+        }
+      }
+    }
+  }
+  if (!Nonlocal)
+    return;
+  if (S.B == Block::Module) {
+    report(kSymtable, X, "nonlocal declaration not allowed at module level");
+    return;
+  }
+  // The names must be bound in an enclosing def: none means no binding.
+  bool Enclosing = false;
+  for (const Scope *P = S.B == Block::Class ? &S : S.Outer; P; P = P->Outer)
+    if (P->B != Block::Module && P->B != Block::Class)
+      Enclosing = true;
+  if (!Enclosing) {
+    bool LineScope = S.Outer != nullptr; // S was opened by a def or class of this line
+    Enclosing = enclosingFunctionBeyond(Logical, !LineScope && S.B != Block::Class);
+  }
+  if (!Enclosing)
+    report(kSymtable, X, std::string("no binding for nonlocal '") + text(child(X, 1)) + "' found");
+}
+
+// ---- expressions ----
+
+void Checker::load(N *X, const Scope &S) {
+  Deeper Guard(Depth);
+  if (Depth > kMaxDepth)
+    return;
+  if (isLeaf(X)) {
+    if (textIs(X, "yield"))
+      yieldExpr(X, S);
+    else if (Py3 && textIs(X, "<>"))
+      report(kParse, X, "invalid syntax", 2);
+    return;
+  }
+  switch (symOf(X)) {
+  case Sym::Atom:
+    return atom(X, S);
+  case Sym::AtomExpr:
+    return atomExpr(X, S);
+  case Sym::Lambdef:
+    return lambdef(X, S);
+  case Sym::YieldExpr:
+    return yieldExpr(X, S);
+  case Sym::StarExpr:
+    starred(X, S);
+    return load(child(X, 1), S);
+  case Sym::Sequence:
+    return elements(X, S, count(X) > 1);
+  default:
+    for (Py_ssize_t I = 0; I < count(X); ++I)
+      load(child(X, I), S);
+  }
+}
+
+/// The items of a list, tuple or set display (StarOk) or of a bracket that
+/// only groups (a starred item there is misplaced).
+void Checker::elements(N *X, const Scope &S, bool StarOk) {
+  for (Py_ssize_t I = 0; I < count(X); ++I) {
+    N *C = child(X, I);
+    if (symOf(C) == Sym::StarExpr) {
+      if (!StarOk)
+        starred(C, S);
+      load(child(C, 1), S);
+    } else {
+      load(C, S);
+    }
+  }
+}
+
+void Checker::starred(N *X, const Scope &) { report(kCompile, X, "can't use starred expression here"); }
+
+void Checker::atom(N *X, const Scope &S) {
+  if (count(X) != 3 || !isLeaf(child(X, 0))) {
+    for (Py_ssize_t I = 0; I < count(X); ++I)
+      load(child(X, I), S);
+    return;
+  }
+  N *Open = child(X, 0), *In = child(X, 1);
+  Sym InS = symOf(In);
+  bool Paren = textIs(Open, "(");
+  if (InS == Sym::TestlistComp || InS == Sym::DictOrSetMaker) {
+    Py_ssize_t Count = count(In);
+    N *Last = child(In, Count - 1);
+    Sym LastS = symOf(Last);
+    if (LastS == Sym::CompFor || LastS == Sym::SyncCompFor) {
+      // A comprehension: elt comp_for, or key ':' value comp_for.
+      comprehension(child(In, 0), Last, S, X, InS == Sym::DictOrSetMaker && Count >= 3);
+      return;
+    }
+    if (InS == Sym::DictOrSetMaker) {
+      bool Dict = false;
+      for (Py_ssize_t I = 0; I < Count; ++I)
+        if (textIs(child(In, I), ":") || textIs(child(In, I), "**"))
+          Dict = true;
+      if (Dict) {
+        for (Py_ssize_t I = 0; I < Count; ++I)
+          load(child(In, I), S);
+        return;
+      }
+      return elements(In, S, true);
+    }
+    return elements(In, S, true);
+  }
+  if (InS == Sym::StarExpr) {
+    // [*a] and {*a} are displays; (*a) only groups.
+    if (Paren)
+      starred(In, S);
+    return load(child(In, 1), S);
+  }
+  load(In, S);
+}
+
+void Checker::atomExpr(N *X, const Scope &S) {
+  Py_ssize_t I = 0;
+  if (count(X) > 0 && isAwait(child(X, 0))) {
+    if (S.B == Block::Module || S.B == Block::Class)
+      report(kCompile, X, "'await' outside function");
+    else if (S.B != Block::AsyncFunction && S.B != Block::Comprehension)
+      report(kCompile, X, "'await' outside async function");
+    I = 1;
+  }
+  for (; I < count(X); ++I) {
+    N *C = child(X, I);
+    if (symOf(C) == Sym::Trailer) {
+      // '(' [arglist] ')' | '[' subscriptlist ']' | '.' NAME
+      if (textIs(child(C, 0), "(")) {
+        if (count(C) == 3)
+          call(child(C, 1), S);
+      } else if (textIs(child(C, 0), "[")) {
+        load(child(C, 1), S);
+      }
+    } else {
+      load(C, S);
+    }
+  }
+}
+
+/// Whether an argument node is a generator argument: test comp_for.
+bool isGenArgument(N *A) {
+  if (symOf(A) != Sym::Argument || count(A) != 2)
+    return false;
+  Sym S = symOf(child(A, 1));
+  return S == Sym::CompFor || S == Sym::SyncCompFor;
+}
+
+void Checker::call(N *Args, const Scope &S) {
+  bool List = symOf(Args) == Sym::Arglist;
+  Py_ssize_t Count = List ? count(Args) : 1;
+  auto item = [&](Py_ssize_t I) { return List ? child(Args, I) : Args; };
+  // A generator argument must be the only item.
+  Py_ssize_t Items = 0, Gens = 0;
+  N *FirstGen = nullptr;
+  for (Py_ssize_t I = 0; I < Count; ++I) {
+    N *A = item(I);
+    if (textIs(A, ","))
+      continue;
+    ++Items;
+    if (isGenArgument(A)) {
+      ++Gens;
+      if (!FirstGen)
+        FirstGen = A;
+    }
+  }
+  if (Py3 && Minor >= 7) {
+    if (Gens && Count > 1) {
+      report(kAst, FirstGen, "Generator expression must be parenthesized");
+      return;
+    }
+  } else {
+    if (Gens && (Gens > 1 || Items > 1)) {
+      report(kAst, Args, "Generator expression must be parenthesized if not sole argument");
+      return;
+    }
+    if (Items > 255) {
+      report(kAst, Args, "more than 255 arguments");
+      return;
+    }
+  }
+  int Keywords = 0;
+  bool DoubleStars = false, Vararg = false;
+  std::vector<std::string> Names;
+  for (Py_ssize_t I = 0; I < Count; ++I) {
+    N *A = item(I);
+    if (textIs(A, ","))
+      continue;
+    if (textIs(A, "*") || textIs(A, "**")) {
+      // Python 2: '*' test and '**' test are items of the arglist.
+      if (I + 1 < Count)
+        load(item(I + 1), S);
+      if (textIs(A, "*"))
+        Vararg = true;
+      ++I;
+      continue;
+    }
+    bool Arg = symOf(A) == Sym::Argument;
+    if (Arg && isGenArgument(A)) {
+      comprehension(child(A, 0), child(A, 1), S, A, false);
+      continue;
+    }
+    if (Arg && count(A) == 2 && (textIs(child(A, 0), "*") || textIs(child(A, 0), "**"))) {
+      bool Star = textIs(child(A, 0), "*");
+      if (Star && DoubleStars) {
+        report(kAst, A, "iterable argument unpacking follows keyword argument unpacking");
+        return;
+      }
+      load(child(A, 1), S);
+      if (!Star) {
+        DoubleStars = true;
+        ++Keywords;
+      }
+      continue;
+    }
+    if (Arg && count(A) == 3 && textIs(child(A, 1), "=")) {
+      N *Key = child(A, 0);
+      load(Key, S);
+      Kind K = kindOf(Key);
+      if (K == Kind::Lambda) {
+        report(kAst, Key, "lambda cannot contain assignment");
+        return;
+      }
+      if (K != Kind::Name) {
+        report(kAst, Key, "keyword can't be an expression");
+        return;
+      }
+      N *KeyName = strip(Key);
+      storeName(KeyName, Py3 ? A : Key, true);
+      for (const std::string &Prev : Names) {
+        if (Prev == text(KeyName)) {
+          report(kAst, Key, "keyword argument repeated");
+          return;
+        }
+      }
+      Names.push_back(text(KeyName));
+      ++Keywords;
+      load(child(A, 2), S);
+      continue;
+    }
+    // A positional argument.
+    if (Keywords) {
+      report(kAst, A,
+             !Py3 ? "non-keyword arg after keyword arg"
+                  : DoubleStars ? "positional argument follows keyword argument unpacking"
+                                : "positional argument follows keyword argument");
+      return;
+    }
+    if (!Py3 && Vararg) {
+      report(kAst, A, "only named arguments may follow *expression");
+      return;
+    }
+    load(A, S);
+  }
+}
+
+void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
+  // Python 2 list comprehensions run in the enclosing scope.
+  bool List = symOf(At) == Sym::Atom && textIs(child(At, 0), "[");
+  bool NewScope = Py3 || !List;
+  Scope Inner{Block::Comprehension, &S};
+  Inner.NoLoop = true;
+  Inner.Comprehension = List ? "list comprehension"
+                             : symOf(At) != Sym::Atom || textIs(child(At, 0), "(") ? "generator expression"
+                                                                                   : Dict ? "dict comprehension"
+                                                                                          : "set comprehension";
+  const Scope &CS = NewScope ? Inner : S;
+  // The element first (key and value), then the clauses.
+  if (Dict) {
+    N *In = child(At, 1);
+    if (textIs(child(In, 0), "**")) {
+      report(kAst, At, "dict unpacking cannot be used in dict comprehension");
+      return;
+    }
+    load(child(In, 0), CS);
+    load(child(In, 2), CS);
+  } else if (symOf(Elt) == Sym::StarExpr) {
+    report(kAst, Elt, "iterable unpacking cannot be used in comprehension");
+    return;
+  } else {
+    load(Elt, CS);
+  }
+  bool First = true, Async = false;
+  // [ASYNC] 'for' exprlist 'in' iterable [comp_iter], and 'if' test [comp_iter].
+  for (N *C = For; C;) {
+    Sym CSym = symOf(C);
+    N *Next = nullptr;
+    if (CSym == Sym::CompFor || CSym == Sym::SyncCompFor) {
+      Py_ssize_t I = 0;
+      if (textIs(child(C, 0), "async")) {
+        Async = true;
+        if (count(C) == 2 && symOf(child(C, 1)) == Sym::SyncCompFor) {
+          C = child(C, 1);
+          continue;
+        }
+        I = 1;
+      }
+      if (count(C) < I + 4)
+        break;
+      exprlistTargets(child(C, I + 1), false, CS);
+      // The first iterable is evaluated in the enclosing scope.
+      load(child(C, I + 3), First ? S : CS);
+      First = false;
+      if (count(C) > I + 4)
+        Next = child(C, I + 4);
+    } else if (!isLeaf(C) && count(C) >= 2 && textIs(child(C, 0), "if")) {
+      load(child(C, 1), CS);
+      if (count(C) > 2)
+        Next = child(C, 2);
+    } else {
+      load(C, CS);
+    }
+    C = Next;
+  }
+  if (Async && Py3) {
+    const Scope *F = function(S);
+    while (F && F->B == Block::Comprehension)
+      F = F->Outer ? function(*F->Outer) : nullptr;
+    if (F && F->B != Block::AsyncFunction)
+      report(kCompile, At, "asynchronous comprehension outside of an asynchronous function");
+  }
+}
+
+void Checker::lambdef(N *X, const Scope &S) {
+  // 'lambda' [varargslist] ':' test
+  std::vector<std::string> Names;
+  if (count(X) == 4)
+    parameters(child(X, 1), S, Names, X);
+  Scope Body{Block::Lambda, &S};
+  Body.NoLoop = true;
+  load(child(X, count(X) - 1), Body);
+}
+
+void Checker::yieldExpr(N *X, const Scope &S) {
+  if (S.B == Block::Module || S.B == Block::Class) {
+    report(kCompile, X, "'yield' outside function");
+  } else if (Py3 && Minor >= 8 && S.B == Block::Comprehension) {
+    report(kSymtable, X, std::string("'yield' inside ") + S.Comprehension);
+  } else if (Py3 && S.B == Block::AsyncFunction && !isLeaf(X) && count(X) == 2 &&
+             !isLeaf(child(X, 1)) && count(child(X, 1)) == 2 && textIs(child(child(X, 1), 0), "from")) {
+    report(kCompile, X, "'yield from' inside async function");
+  }
+  if (!isLeaf(X))
+    for (Py_ssize_t I = 1; I < count(X); ++I) {
+      N *C = child(X, I);
+      if (!isLeaf(C) && count(C) == 2 && textIs(child(C, 0), "from"))
+        load(child(C, 1), S);
+      else
+        load(C, S);
+    }
+}
+
+// ---- assignment targets ----
+
+Kind Checker::kindOf(N *X) {
+  if (isLeaf(X)) {
+    switch (symOf(X)) {
+    case Sym::Name:
+      return Kind::Name;
+    case Sym::Number:
+    case Sym::String:
+      return Kind::Literal;
+    case Sym::Keyword:
+      if (textIs(X, "yield"))
+        return Kind::Yield;
+      if (Py3 && (textIs(X, "None") || textIs(X, "True") || textIs(X, "False")))
+        return Kind::NameConstant;
+      if (!Py3 && (textIs(X, "None") || textIs(X, "True") || textIs(X, "False")))
+        return Kind::Name;
+      return Kind::Other;
+    default:
+      return Py3 && X->ClsInfo && X->ClsInfo->NodeType == kEllipsis ? Kind::Ellipsis : Kind::Other;
+    }
+  }
+  Py_ssize_t Count = count(X);
+  switch (symOf(X)) {
+  case Sym::Atom: {
+    N *Open = child(X, 0);
+    if (symOf(Open) == Sym::String)
+      return Kind::Literal;
+    if (textIs(Open, "`"))
+      return Kind::Repr;
+    if (Count == 2)
+      return textIs(Open, "(") ? Kind::EmptyTuple : textIs(Open, "[") ? Kind::List : Kind::Literal;
+    if (Count != 3)
+      return Kind::Other;
+    N *In = child(X, 1);
+    Sym InS = symOf(In);
+    bool Comp = false, Dict = false, Comma = false;
+    if (InS == Sym::TestlistComp || InS == Sym::DictOrSetMaker) {
+      for (Py_ssize_t I = 0; I < count(In); ++I) {
+        N *C = child(In, I);
+        Sym CS = symOf(C);
+        if (CS == Sym::CompFor || CS == Sym::SyncCompFor)
+          Comp = true;
+        else if (textIs(C, ":") || textIs(C, "**"))
+          Dict = true;
+        else if (textIs(C, ","))
+          Comma = true;
+      }
+    }
+    if (textIs(Open, "(")) {
+      if (InS == Sym::YieldExpr || textIs(In, "yield"))
+        return Kind::Yield;
+      if (Comp)
+        return Kind::GeneratorExp;
+      if (Comma)
+        return Kind::Tuple;
+      return kindOf(In);
+    }
+    if (textIs(Open, "["))
+      return Comp ? Kind::ListComp : Kind::List;
+    if (Comp)
+      return Dict ? Kind::DictComp : Kind::SetComp;
+    return Kind::Literal;
+  }
+  case Sym::AtomExpr: {
+    if (isAwait(child(X, 0)))
+      return Kind::Await;
+    for (Py_ssize_t I = 0; I < Count; ++I)
+      if (textIs(child(X, I), "**"))
+        return Kind::Operator;
+    N *Last = child(X, Count - 1);
+    if (symOf(Last) != Sym::Trailer)
+      return Kind::Other;
+    N *Open = child(Last, 0);
+    return textIs(Open, "(") ? Kind::Call : textIs(Open, "[") ? Kind::Subscript : Kind::Attribute;
+  }
+  case Sym::Test:
+    return Count >= 2 && textIs(child(X, 1), "if") ? Kind::IfExp : Kind::Other;
+  case Sym::OrAnd:
+  case Sym::NotTest:
+  case Sym::BinOp:
+  case Sym::Factor:
+    return Kind::Operator;
+  case Sym::Comparison:
+    return Kind::Compare;
+  case Sym::Lambdef:
+    return Kind::Lambda;
+  case Sym::StarExpr:
+    return Kind::Starred;
+  case Sym::YieldExpr:
+    return Kind::Yield;
+  case Sym::Sequence:
+    return Kind::Tuple;
+  default:
+    return Kind::Other;
+  }
+}
+
+/// The message of a subtree that cannot be assigned or deleted, or nullptr.
+const char *unassignable(Kind K, bool Py3) {
+  switch (K) {
+  case Kind::Lambda:
+    return "lambda";
+  case Kind::Call:
+    return "function call";
+  case Kind::Operator:
+    return "operator";
+  case Kind::GeneratorExp:
+    return "generator expression";
+  case Kind::Yield:
+    return "yield expression";
+  case Kind::Await:
+    return "await expression";
+  case Kind::ListComp:
+    return "list comprehension";
+  case Kind::SetComp:
+    return "set comprehension";
+  case Kind::DictComp:
+    return "dict comprehension";
+  case Kind::Literal:
+    return "literal";
+  case Kind::NameConstant:
+    return "keyword";
+  case Kind::Ellipsis:
+    return "Ellipsis";
+  case Kind::Compare:
+    return "comparison";
+  case Kind::IfExp:
+    return "conditional expression";
+  case Kind::Repr:
+    return "repr";
+  case Kind::EmptyTuple:
+    return Py3 ? nullptr : "()";
+  default:
+    return nullptr;
+  }
+}
+
+/// A name bound by the statement: __debug__ (and None in Python 2) cannot be.
+void Checker::storeName(N *NameLeaf, N *Loc, bool FullChecks) {
+  const char *T = text(NameLeaf);
+  if (Py3) {
+    if (strcmp(T, "__debug__") == 0 ||
+        (FullChecks && (strcmp(T, "None") == 0 || strcmp(T, "True") == 0 || strcmp(T, "False") == 0)))
+      report(kAst, Loc, "assignment to keyword");
+  } else if (strcmp(T, "None") == 0 || strcmp(T, "__debug__") == 0) {
+    report(kAst, Loc, std::string("cannot assign to ") + T);
+  }
+}
+
+/// set_context: whether X can be assigned (or deleted), reported at Loc.
+void Checker::setContext(N *X, bool Del, N *Loc) {
+  X = strip(X);
+  Kind K = kindOf(X);
+  switch (K) {
+  case Kind::Name:
+    if (!Del)
+      storeName(X, Loc, false);
+    return;
+  case Kind::Attribute:
+    if (!Del) {
+      N *Last = child(X, count(X) - 1);
+      if (count(Last) == 2)
+        storeName(child(Last, 1), Loc, true);
+    }
+    return;
+  case Kind::Subscript:
+    return;
+  case Kind::Starred:
+    return setContext(child(X, 1), Del, Loc);
+  case Kind::Tuple:
+  case Kind::List: {
+    N *Seq = X;
+    if (symOf(X) == Sym::Atom) {
+      if (count(X) != 3)
+        return;
+      Seq = child(X, 1);
+      if (symOf(Seq) != Sym::TestlistComp && symOf(Seq) != Sym::Sequence)
+        return setContext(Seq, Del, Loc);
+    }
+    for (Py_ssize_t I = 0; I < count(Seq); I += 2)
+      setContext(child(Seq, I), Del, Loc);
+    return;
+  }
+  default:
+    break;
+  }
+  if (const char *What = unassignable(K, Py3))
+    report(kAst, Loc, std::string(Del ? "can't delete " : "can't assign to ") + What);
+}
+
+/// The items of a list or tuple target (or the target itself).
+static N *sequenceOf(N *X, Kind K) {
+  if (K != Kind::Tuple && K != Kind::List)
+    return nullptr;
+  X = strip(X);
+  if (symOf(X) == Sym::Atom) {
+    if (count(X) != 3)
+      return nullptr;
+    N *In = child(X, 1);
+    return symOf(In) == Sym::TestlistComp || symOf(In) == Sym::Sequence ? In : nullptr;
+  }
+  return X;
+}
+
+/// The starred items of a store target, for the code generator's checks.
+void Checker::countStars(N *X, bool Top) {
+  X = strip(X);
+  Kind K = kindOf(X);
+  if (K == Kind::Starred) {
+    if (Top)
+      report(kCompile, X, "starred assignment target must be in a list or tuple");
+    countStars(child(X, 1), false);
+    return;
+  }
+  N *Seq = sequenceOf(X, K);
+  if (!Seq) {
+    // [x] and [*x]: a one-item list.
+    if (K == Kind::List && symOf(X) == Sym::Atom && count(X) == 3)
+      countStars(child(X, 1), false);
+    return;
+  }
+  int Stars = 0;
+  for (Py_ssize_t I = 0; I < count(Seq); I += 2)
+    if (kindOf(child(Seq, I)) == Kind::Starred)
+      ++Stars;
+  if (Stars > 1)
+    report(kCompile, X, "two starred expressions in assignment");
+  for (Py_ssize_t I = 0; I < count(Seq); I += 2) {
+    N *C = strip(child(Seq, I));
+    countStars(kindOf(C) == Kind::Starred ? child(C, 1) : C, false);
+  }
+}
+
+/// One assignment target: its expressions first, then whether it can be bound.
+void Checker::target(N *X, bool Del, N *Loc, const Scope &S) {
+  // The target's own expressions, with its starred items allowed.
+  std::vector<N *> Todo{X};
+  while (!Todo.empty()) {
+    N *Y = strip(Todo.back());
+    Todo.pop_back();
+    Kind K = kindOf(Y);
+    if (K == Kind::Starred) {
+      Todo.push_back(child(Y, 1));
+    } else if (N *Seq = sequenceOf(Y, K)) {
+      for (Py_ssize_t I = count(Seq); I-- > 0;)
+        if (!textIs(child(Seq, I), ","))
+          Todo.push_back(child(Seq, I));
+    } else if (K == Kind::List && symOf(Y) == Sym::Atom && count(Y) == 3) {
+      Todo.push_back(child(Y, 1));
+    } else {
+      load(Y, S);
+    }
+  }
+  setContext(X, Del, Loc);
+  if (Del) {
+    // del *a: a starred item has nowhere to go.
+    std::vector<N *> Stars{X};
+    while (!Stars.empty()) {
+      N *Y = strip(Stars.back());
+      Stars.pop_back();
+      Kind K = kindOf(Y);
+      if (K == Kind::Starred) {
+        starred(Y, S);
+      } else if (N *Seq = sequenceOf(Y, K)) {
+        for (Py_ssize_t I = count(Seq); I-- > 0;)
+          if (!textIs(child(Seq, I), ","))
+            Stars.push_back(child(Seq, I));
+      } else if (K == Kind::List && symOf(Y) == Sym::Atom && count(Y) == 3) {
+        Stars.push_back(child(Y, 1));
+      }
+    }
+  } else if (Py3) {
+    countStars(X, true);
+  }
+}
+
+/// The targets of del, for and comprehension clauses: each item of an
+/// exprlist is its own target, located at itself.
+void Checker::exprlistTargets(N *X, bool Del, const Scope &S) {
+  if (symOf(X) != Sym::Sequence) {
+    target(X, Del, X, S);
+    return;
+  }
+  int Stars = 0;
+  for (Py_ssize_t I = 0; I < count(X); I += 2) {
+    N *C = child(X, I);
+    N *Inner = strip(C);
+    // for a, *b in x: the items unpack together, so a starred item is fine.
+    if (!Del && Py3 && kindOf(Inner) == Kind::Starred) {
+      ++Stars;
+      target(child(Inner, 1), false, C, S);
+    } else {
+      target(C, Del, C, S);
+    }
+  }
+  if (Stars > 1)
+    report(kCompile, X, "two starred expressions in assignment");
+}
+
+// ---- parameters ----
+
+void Checker::paramNames(N *X, std::vector<std::string> &Names) {
+  if (isLeaf(X)) {
+    if (symOf(X) == Sym::Name || symOf(X) == Sym::Keyword)
+      Names.push_back(text(X));
+    return;
+  }
+  Sym XS = symOf(X);
+  if (XS == Sym::ParamDef) {
+    // NAME [':' test], or '(' fplist ')'
+    if (textIs(child(X, 0), "("))
+      paramNames(child(X, 1), Names);
+    else
+      paramNames(child(X, 0), Names);
+  } else if (XS == Sym::FpList) {
+    for (Py_ssize_t I = 0; I < count(X); I += 2)
+      paramNames(child(X, I), Names);
+  }
+}
+
+void Checker::parameters(N *X, const Scope &S, std::vector<std::string> &Names, N *Owner) {
+  if (symOf(X) == Sym::Parameters) {
+    // '(' [typedargslist] ')'
+    if (count(X) != 3)
+      return;
+    X = child(X, 1);
+  }
+  std::vector<N *> Items;
+  if (symOf(X) == Sym::ArgsList) {
+    for (Py_ssize_t I = 0; I < count(X); ++I)
+      Items.push_back(child(X, I));
+  } else {
+    Items.push_back(X);
+  }
+  // The parameters in order: names, defaults, the bare '*' rule.
+  bool FoundDefault = false, KeywordOnly = false;
+  N *BareStar = nullptr;
+  size_t Count = Items.size();
+  for (size_t I = 0; I < Count; ++I) {
+    N *C = Items[I];
+    if (textIs(C, ",") || textIs(C, "/"))
+      continue;
+    if (textIs(C, "*") || textIs(C, "**")) {
+      bool Star = textIs(C, "*");
+      bool HasName = I + 1 < Count && !textIs(Items[I + 1], ",");
+      if (Star && !HasName) {
+        BareStar = C;
+        // A bare '*' needs a named parameter after it.
+        bool Named = false;
+        for (size_t J = I + 1; J < Count; ++J) {
+          if (textIs(Items[J], "**"))
+            break;
+          if (!isLeaf(Items[J]) || symOf(Items[J]) == Sym::Name) {
+            Named = true;
+            break;
+          }
+        }
+        if (!Named && Py3) {
+          // CPython points at the item after ", " (the '**'), or at the '*'.
+          N *At = C;
+          if (I + 2 < Count)
+            At = Items[I + 2];
+          report(kAst, At, "named arguments must follow bare *");
+          return;
+        }
+      }
+      if (Star)
+        KeywordOnly = true;
+      if (HasName) {
+        N *P = Items[I + 1];
+        N *NameLeaf = isLeaf(P) ? P : child(P, 0);
+        storeName(NameLeaf, NameLeaf, false);
+        if (!isLeaf(P) && count(P) == 3)
+          load(child(P, 2), S);
+        paramNames(P, Names);
+        ++I;
+      }
+      continue;
+    }
+    // A parameter, maybe with '=' default.
+    N *NameLeaf = isLeaf(C) ? C : textIs(child(C, 0), "(") ? nullptr : child(C, 0);
+    bool Default = I + 1 < Count && textIs(Items[I + 1], "=");
+    if (Default) {
+      load(Items[I + 2], S);
+      if (!KeywordOnly)
+        FoundDefault = true;
+    } else if (FoundDefault && !KeywordOnly) {
+      report(kAst, Py3 ? X : C, "non-default argument follows default argument");
+      return;
+    }
+    if (NameLeaf) {
+      storeName(NameLeaf, NameLeaf, false);
+      if (!isLeaf(C) && count(C) == 3)
+        load(child(C, 2), S);
+    } else {
+      std::vector<std::string> Inner;
+      paramNames(C, Inner);
+      (void)Inner;
+    }
+    paramNames(C, Names);
+    if (Default)
+      I += 2;
+  }
+  (void)BareStar;
+  for (size_t I = 0; I < Names.size(); ++I) {
+    for (size_t J = 0; J < I; ++J) {
+      if (Names[I] == Names[J]) {
+        report(kSymtable, Owner, "duplicate argument '" + Names[I] + "' in function definition");
+        return;
+      }
+    }
+  }
+}
+
+// ---- the error ----
+
+void Checker::raise() {
+  for (int P = 0; P < kPassCount; ++P) {
+    const Found &F = First[P];
+    if (!F.Set)
+      continue;
+    Py_ssize_t Count = L->TokenCount;
+    Py_ssize_t I = F.TokI < Count ? F.TokI : Count - 1;
+    long Row = I >= 0 ? L->Positions[I].Row : 0;
+    long Col = I >= 0 ? L->Positions[I].Col : 0;
+    Ref Text = tl::require(PyObject_CallMethod(host::Host.LogicalInspect, const_cast<char *>("TextFromTokens"),
+                                               const_cast<char *>("(O)"), Logical));
+    Ref Msg = tl::require(PyString_FromStringAndSize(F.Msg.data(), static_cast<Py_ssize_t>(F.Msg.size())));
+    // CPython 2 gives no column for these errors; CPython 3 the node's 0-based
+    // column (the parser's own errors, a 1-based one).
+    Ref Offset = Ref::borrow(Py_None);
+    long Column = Col + 1 + F.ColDelta;
+    if (P == kParse)
+      Offset = tl::require(PyInt_FromLong(Col + 1 + F.ColDelta));
+    else if (Py3)
+      Offset = tl::require(PyInt_FromLong(Col));
+    Ref Error = tl::require(PyObject_CallFunction(PyExc_SyntaxError, const_cast<char *>("(O(slOO))"), Msg.get(),
+                                                  "<string>", Row + 1, Offset.get(), Text.get()));
+    // The 1-based column of the place, whatever CPython's offset says.
+    Ref ColumnObj = tl::require(PyInt_FromLong(Column));
+    tl::requireStatus(PyObject_SetAttrString(Error.get(), "column", ColumnObj.get()));
+    PyErr_SetObject(PyExc_SyntaxError, Error.get());
+    throw tl::PyErrSet();
+  }
+}
+
+} // namespace
+
+void checkLine(ParserObject *P, PyObject *Tree, PyObject *Logical, bool InAsyncDef) {
+  if (!Tree || !isNode(Tree) || !host::isLogical(Logical))
+    return;
+  (void)InAsyncDef;
+  Checker C(P, Logical);
+  C.run(reinterpret_cast<NodeObject *>(Tree));
+}
+
+} // namespace checks
+} // namespace treelens

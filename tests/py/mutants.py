@@ -1,0 +1,167 @@
+"""Mutated real statements judged by CPython: the analyzer's syntax verdicts against compile().
+
+One-line statements of a standard library are mutated once or twice (a token
+deleted, inserted from a pool, swapped with its neighbour or replaced), put in
+a random enclosing block (module, def, class, loop, async def) and compiled by
+the CPython of the same version. Run as a script to print the disagreements:
+
+    python2.7 -m tests.py.mutants 3.6 [count]
+"""
+
+import json
+import random
+import sys
+
+from pysource import _fastaccess
+from pysource import utils
+from tests.py import support
+
+kComment = 202
+# Lines a line-by-line analyzer cannot judge alone: clauses that continue a
+# statement above them, and decorators, which need the def below.
+kContinuations = (b'else', b'elif', b'except', b'finally', b'try', b'@')
+kPool = (b'=', b'(', b')', b'[', b']', b',', b'*', b'**', b'.', b':', b'+', b'-', b'==', b'<>', b'+=',
+         b'lambda', b'yield', b'return', b'None', b'True', b'False', b'__debug__', b'not', b'in', b'if',
+         b'else', b'for', b'del', b'await', b'async', b'global', b'nonlocal', b'break', b'continue',
+         b'1', b"'s'", b'x', b'f', b'...', b'is', b'and', b'as', b'from', b'import', b'print',
+         b'pass', b'with', b'{', b'}', b';')
+kContexts = {
+    'module': (b'', b''),
+    'def': (b'def f():\n', b'    '),
+    'class': (b'class C:\n', b'    '),
+    'loop': (b'def f():\n    for _ in _it:\n', b'        '),
+    'while': (b'while _c:\n', b'    '),
+    'finally': (b'for _ in _it:\n    try:\n        pass\n    finally:\n', b'        '),
+    'async': (b'async def f():\n', b'    '),
+}
+
+
+def Statements(version, files):
+    """Token lists of the one-line statements of some files (comments dropped)."""
+    found = []
+    for path in files:
+        for logical in utils.GetLogicalsFromText(support.ReadBytes(path)):
+            if logical.fLineText.count(b'\n') != 1 or logical.fTokenCount == 0:
+                continue
+            toks = [logical.GetTokenString(i) for i in range(logical.fTokenCount)]
+            toks = [t for t in toks if _fastaccess.GetTokenType(t) != kComment]
+            if toks and not toks[0].startswith(kContinuations) and len(toks) < 40:
+                found.append(toks)
+    return found
+
+
+def Mutate(toks, rnd):
+    """A copy of toks with one or two random edits."""
+    toks = list(toks)
+    for _ in range(rnd.choice((1, 1, 2))):
+        op = rnd.randrange(4)
+        i = rnd.randrange(len(toks) + (op == 1))
+        if op == 0 and len(toks) > 1:
+            del toks[i]
+        elif op == 1:
+            toks.insert(i, rnd.choice(kPool))
+        elif op == 2 and i + 1 < len(toks):
+            toks[i], toks[i + 1] = toks[i + 1], toks[i]
+        elif i < len(toks):
+            toks[i] = rnd.choice(kPool)
+    return toks
+
+
+def Sources(version, count, seed=4321, files=None):
+    """(source, context) of `count` distinct mutated statements in random blocks."""
+    rnd = random.Random(seed)
+    statements = Statements(version, files if files is not None else support.CorpusFiles(version, 400, seed))
+    contexts = sorted(k for k in kContexts if version != '2.7' or k != 'async')
+    seen, out = set(), []
+    while len(out) < count and statements:
+        toks = Mutate(rnd.choice(statements), rnd)
+        if not toks or toks[0].startswith(kContinuations):
+            continue
+        line = b' '.join(toks)
+        if line in seen:
+            continue
+        seen.add(line)
+        context = rnd.choice(contexts)
+        head, indent = kContexts[context]
+        source = head + indent + line + b'\n'
+        if toks[-1] == b':':
+            source += indent + b'    pass\n'
+        out.append((source, context))
+    return out
+
+
+kOracle = r'''
+import json, sys, warnings
+warnings.simplefilter('ignore')
+out = []
+for text in json.load(sys.stdin):
+    try:
+        compile(text.encode('latin-1'), '<string>', 'exec')
+        out.append(None)
+    except SyntaxError as e:
+        out.append([str(e.msg), e.lineno, e.offset])
+    except (ValueError, TypeError) as e:
+        out.append(['%s: %s' % (type(e).__name__, e), 0, 0])
+sys.stdout.write(json.dumps(out))
+'''
+
+
+def Verdicts(version, sources):
+    """CPython's verdict on each source: None or [message, line, offset]; None if no CPython."""
+    data = json.dumps([s.decode('latin-1') for s in sources])
+    out = support.RunOracle(version, kOracle, data)
+    return None if out is None else json.loads(out)
+
+
+def Ours(version, source, checks=True):
+    """The analyzer's first error in a source: None or [message, line, column]."""
+    from pysource import analysis
+    result = analysis.AnalyzeText(source, version, checks=checks)
+    for logical, error in zip(result.logicals, result.errors):
+        if error is not None:
+            return [error.msg, logical.fFirstLine + (error.lineno or 1), error.offset]
+    return None
+
+
+def Compare(version, count, seed=4321, checks=True):
+    """(sources, cpython verdicts, our verdicts) of `count` mutants; None without CPython."""
+    items = Sources(version, count, seed)
+    sources = [s for s, _ in items]
+    theirs = Verdicts(version, sources)
+    if theirs is None:
+        return None
+    return items, theirs, [Ours(version, s, checks) for s in sources]
+
+
+def Main(argv):
+    version = argv[1]
+    count = int(argv[2]) if len(argv) > 2 else 20000
+    found = Compare(version, count)
+    if found is None:
+        print('no CPython %s' % version)
+        return 1
+    items, theirs, ours = found
+    rejected = sum(1 for t in theirs if t is not None)
+    false_reject = [(i, t, o) for i, (t, o) in enumerate(zip(theirs, ours)) if t is None and o]
+    false_accept = [(i, t, o) for i, (t, o) in enumerate(zip(theirs, ours)) if t and o is None]
+    same_msg = sum(1 for t, o in zip(theirs, ours) if t and o and t[0] == o[0])
+    same_loc = sum(1 for t, o in zip(theirs, ours) if t and o and t[0] == o[0] and t[1:] == o[1:])
+    for kind, cases in (('ACCEPTED BY CPYTHON, REJECTED', false_reject),
+                        ('REJECTED BY CPYTHON, ACCEPTED', false_accept)):
+        print('== %s: %d' % (kind, len(cases)))
+        for i, t, o in cases:
+            print('%-8s %r\n         cpython %r ours %r' % (items[i][1], items[i][0], t, o))
+    wrong = [(i, t, o) for i, (t, o) in enumerate(zip(theirs, ours)) if t and o and t[0] != o[0]]
+    print('== OTHER MESSAGE: %d' % len(wrong))
+    for i, t, o in wrong:
+        print('%-8s %r\n         cpython %r ours %r' % (items[i][1], items[i][0], t, o))
+    print('%d mutants, %d rejected by CPython; false rejects %d, false accepts %d (%.3f%%), '
+          'same message %d (%.1f%%), same message and place %d'
+          % (len(items), rejected, len(false_reject), len(false_accept),
+             100.0 * len(false_accept) / max(rejected, 1), same_msg,
+             100.0 * same_msg / max(rejected, 1), same_loc))
+    return 0
+
+
+if __name__ == '__main__':
+    sys.exit(Main(sys.argv))
