@@ -2,8 +2,9 @@
 
 Both sides run in this process over the same logical lines, split beforehand
 with GetLogicalsFromText. treelens runs CPGenAnalyzerImpl.AnalyzeSingleLogical
-with the 2.7 grammar on every logical line (parse, walk, record, discard), and,
-for comparison, the parse alone (ParseToNode and DiscardNode of a parser of the
+with the 2.7 grammar on every logical line (parse, walk, record, discard),
+once more with the syntax checks after parsing switched on, and, for
+comparison, the parse alone (ParseToNode and DiscardNode of a parser of the
 same grammar). The peers are CPython 2.7's compile(..., ast.PyCF_ONLY_AST) on
 the source text of the same lines, completed the way the analyzer completes
 them (a block header gets a "pass" body, a lone else/elif/except/finally its
@@ -214,15 +215,20 @@ def main():
     analyzer = treelens.CPGenAnalyzerImpl((2, 7, 0), treelens.kPy2DefaultGrammar, None, False)
     n = len(logicals)
     ours = TimeTreelens(analyzer, logicals, repeat)
+    checking = treelens.CPGenAnalyzerImpl((2, 7, 0), treelens.kPy2DefaultGrammar, None, False,
+                                          syntax_checks=True)
+    checked = TimeTreelens(checking, logicals, repeat)
     parse_only = TimeParseOnly(logicals, repeat)
     peer = TimeCPython(sources, repeat)
     peer_walk = TimeCPythonWalk(sources, repeat)
     print('logical lines: %d (best of %d runs)' % (n, repeat))
     print('treelens AnalyzeSingleLogical (full analysis): %7.3f us/line' % (ours * 1e6 / n))
+    print('treelens full analysis with the syntax checks: %7.3f us/line' % (checked * 1e6 / n))
     print('treelens parse only (ParseToNode + DiscardNode): %7.3f us/line' % (parse_only * 1e6 / n))
     print('CPython compile(PyCF_ONLY_AST): %7.3f us/line' % (peer * 1e6 / n))
     print('CPython compile + ast.walk of names: %7.3f us/line' % (peer_walk * 1e6 / n))
     print('ratio full analysis / parse only: %.3f' % (ours / parse_only))
+    print('ratio with the syntax checks / full analysis: %.3f' % (checked / ours))
     print('ratio full analysis / CPython compile: %.3f' % (ours / peer))
     print('ratio full analysis / CPython compile + walk: %.3f' % (ours / peer_walk))
     render_repeat = int(sys.argv[3]) if len(sys.argv) > 3 else 1

@@ -307,7 +307,10 @@ def ErrorLocation(logical, error):
     """(line, column, message) of a record's SyntaxError: the line in the file, 1-based,
     and the byte column in that line, 1-based."""
     row = error.lineno or 1
-    return logical.fFirstLine + row, error.offset or 1, error.msg
+    # The syntax checks give CPython's offset (0-based or None) and the
+    # 1-based column apart.
+    column = getattr(error, 'column', None) or error.offset or 1
+    return logical.fFirstLine + row, column, error.msg
 
 
 kNoDerivedInfo = ((), (), (), (), ())

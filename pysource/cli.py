@@ -152,10 +152,11 @@ def TextBlock(path, logical, error):
 class Options(object):
     """What the output of a file depends on."""
 
-    def __init__(self, version, fmt, errors_only):
+    def __init__(self, version, fmt, errors_only, checks=True):
         self.version = version
         self.fmt = fmt
         self.errors_only = errors_only
+        self.checks = checks
 
 
 def _PathBytes(path):
@@ -195,9 +196,9 @@ def ReportTask(task, options):
     if problem is not None:
         result = analysis.FileAnalysis(path, status=status, problem=problem)
     elif text is not None:
-        result = analysis.AnalyzeText(text, options.version, path)
+        result = analysis.AnalyzeText(text, options.version, path, options.checks)
     else:
-        result = analysis.AnalyzeFile(path, options.version)
+        result = analysis.AnalyzeFile(path, options.version, options.checks)
     return Report(result, options)
 
 
@@ -299,6 +300,10 @@ def _ParseArgs(argv):
                         help='output format (default text)')
     parser.add_argument('--errors-only', action='store_true',
                         help='report only syntax errors (text: path:line:col: message)')
+    parser.add_argument('--no-checks', dest='checks', action='store_false',
+                        help='report only what the grammar rejects, not the errors CPython finds '
+                        'after parsing (targets that cannot be assigned, misplaced arguments, '
+                        'return outside a function, ...)')
     parser.add_argument('--stdin-filename', default='-', metavar='NAME',
                         help='the path to report for standard input')
     parser.add_argument('-j', '--jobs', type=int, default=1, metavar='N',
@@ -332,7 +337,7 @@ def Main(argv=None, stdin=None, stdout=None, stderr=None):
 
 def _Run(args, stdin, out, err):
     started = time.time()
-    options = Options(args.lang, args.format, args.errors_only)
+    options = Options(args.lang, args.format, args.errors_only, args.checks)
     tasks = _Tasks(args, stdin)
     progress = Progress(len(tasks), _Silent() if args.quiet else err)
     pool = None

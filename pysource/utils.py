@@ -27,7 +27,10 @@ def InAsyncDef(logical):
     inside; the parser sees its `async` keyword there on its own.
     """
     scope = logical.fParentScope
-    while scope is not None:
+    seen = set()
+    # A chain set by hand may loop: each record is looked at once.
+    while scope is not None and id(scope) not in seen:
+        seen.add(id(scope))
         if scope.fKind == 2 and _StartsAsyncDef(scope):
             return True
         scope = scope.fParentScope

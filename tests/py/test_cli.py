@@ -93,6 +93,10 @@ class CliTest(unittest.TestCase):
             os.path.join(self.tmp, 'link.py') + b': error: cannot read: No such file or directory'])
         status, out, err = Treelens('--errors-only', '--lang', '2.7', '-', stdin=b'print x\n')
         self.assertEqual((status, out), (0, b''))
+        # CPython's checks after parsing, unless switched off.
+        for flags, expected in (((), (1, b'-:2:1: can\'t assign to function call\n')), (('--no-checks',), (0, b''))):
+            status, out, err = Treelens('--errors-only', '--lang', '3.6', '-', *flags, stdin=b'x = 1\nf() = x\n')
+            self.assertEqual((status, out), expected, flags)
 
     def testJsonRoundTripsEveryText(self):
         texts = {'latin1.py': b'# -*- coding: latin-1 -*-\ns = "caf\xe9"\r\nt = "\xed\xa0\x80"\n',

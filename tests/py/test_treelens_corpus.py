@@ -150,7 +150,7 @@ import json, sys
 ok = []
 for key, src in json.loads(sys.stdin.read()):
     try:
-        compile(src.encode('latin-1'), '<s>', 'exec', 0x400)
+        compile(src.encode('latin-1'), '<s>', 'exec')
         ok.append(key)
     except (SyntaxError, ValueError, TypeError):
         pass
@@ -167,7 +167,7 @@ def OracleCompiles(version, items):
 
 def Compiles27(source):
     try:
-        compile(source, '<s>', 'exec', 0x400)
+        compile(source, '<s>', 'exec')
         return True
     except (SyntaxError, ValueError, TypeError):
         return False

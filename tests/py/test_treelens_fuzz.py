@@ -73,7 +73,9 @@ class FuzzTest(unittest.TestCase):
         analyzers = [tl.CPGenAnalyzerImpl((2, 7, 0), tl.kPy2DefaultGrammar, None, False),
                      tl.CPGenAnalyzerImpl((3, 5, 0), 'Python-Grammar-3.5'),
                      tl.CPGenAnalyzerImpl((3, 6, 0)),
-                     tl.CPGenAnalyzerImpl((3, 7, 0))]
+                     tl.CPGenAnalyzerImpl((3, 7, 0)),
+                     tl.CPGenAnalyzerImpl((2, 7, 0), tl.kPy2DefaultGrammar, None, False, syntax_checks=True),
+                     tl.CPGenAnalyzerImpl((3, 6, 0), syntax_checks=True)]
         lines, vocab = [], set(kSpecial)
         for path in support.CorpusFiles('2.7', limit=25) + support.CorpusFiles('3.6', limit=25):
             for logical in utils.GetLogicalsFromText(support.ReadBytes(path)):
@@ -132,7 +134,9 @@ class FuzzTest(unittest.TestCase):
                     if result is not None:
                         self.assertIsInstance(result, SyntaxError, repr(src))
                         self.assertEqual(result.filename, '<string>')
-                        self.assertGreaterEqual(min(result.lineno, result.offset), 1, repr(src))
+                        # The checks give CPython's offsets: 0-based, or None under 2.7.
+                        offset = getattr(result, 'column', result.offset)
+                        self.assertGreaterEqual(min(result.lineno, offset), 1, repr(src))
                         self.assertEqual((logical.fNamesDefined, logical.fTypeEquivs), ([], []))
 
 

@@ -180,7 +180,13 @@ using N = NodeObject;
 
 inline bool isLeaf(N *X) { return X->Children == nullptr; }
 inline Py_ssize_t count(N *X) { return X->Children ? PyList_GET_SIZE(X->Children) : 0; }
-inline N *child(N *X, Py_ssize_t I) { return reinterpret_cast<N *>(PyList_GET_ITEM(X->Children, I)); }
+/// Stands for a child a grammar of unexpected shape does not have: a leaf
+/// with no text and no state, which no check matches.
+NodeObject Missing;
+
+inline N *child(N *X, Py_ssize_t I) {
+  return I >= 0 && I < count(X) ? reinterpret_cast<N *>(PyList_GET_ITEM(X->Children, I)) : &Missing;
+}
 
 /// The leaf's text ("" when it has none).
 inline const char *text(N *X) { return X->Text && PyString_Check(X->Text) ? PyString_AS_STRING(X->Text) : ""; }
@@ -290,7 +296,8 @@ struct Found {
   bool Set = false;
   std::string Msg;
   Py_ssize_t TokI = 0;
-  int ColDelta = 0; ///< added to the column of the token (the parser's errors point past a token)
+  int ColDelta = 0;       ///< added to the column of the token (the parser's errors point past a token)
+  bool LineStart = false; ///< CPython gives column 0 whatever the token
 };
 
 class Checker {
@@ -318,7 +325,7 @@ private:
   int Minor;
   Found First[kPassCount];
 
-  void report(Pass P, N *At, std::string Msg, int ColDelta = 0) {
+  void report(Pass P, N *At, std::string Msg, int ColDelta = 0, bool LineStart = false) {
     if (First[P].Set)
       return;
     First[P].Set = true;
@@ -327,6 +334,7 @@ private:
     long I = Leaf->Context && PyInt_Check(Leaf->Context) ? PyInt_AS_LONG(Leaf->Context) : 0;
     First[P].TokI = I;
     First[P].ColDelta = ColDelta;
+    First[P].LineStart = LineStart;
   }
   void raise();
 
@@ -849,7 +857,8 @@ void Checker::namesStmt(N *X, const Scope &S, bool Nonlocal) {
     bool LineScope = S.Outer != nullptr; // S was opened by a def or class of this line
     Enclosing = enclosingFunctionBeyond(Logical, !LineScope && S.B != Block::Class);
   }
-  if (!Enclosing)
+  // A method's __class__ is bound by its class, whatever the chain shows.
+  if (!Enclosing && strcmp(text(child(X, 1)), "__class__") != 0)
     report(kSymtable, X, std::string("no binding for nonlocal '") + text(child(X, 1)) + "' found");
 }
 
@@ -863,7 +872,7 @@ void Checker::load(N *X, const Scope &S) {
     if (textIs(X, "yield"))
       yieldExpr(X, S);
     else if (Py3 && textIs(X, "<>"))
-      report(kParse, X, "invalid syntax", 2);
+      report(kParse, X, "invalid syntax", 1);
     return;
   }
   switch (symOf(X)) {
@@ -1148,7 +1157,7 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
     while (F && F->B == Block::Comprehension)
       F = F->Outer ? function(*F->Outer) : nullptr;
     if (F && F->B != Block::AsyncFunction)
-      report(kCompile, At, "asynchronous comprehension outside of an asynchronous function");
+      report(kCompile, At, "asynchronous comprehension outside of an asynchronous function", 0, true);
   }
 }
 
@@ -1617,7 +1626,7 @@ void Checker::raise() {
     if (P == kParse)
       Offset = tl::require(PyInt_FromLong(Col + 1 + F.ColDelta));
     else if (Py3)
-      Offset = tl::require(PyInt_FromLong(Col));
+      Offset = tl::require(PyInt_FromLong(F.LineStart ? 0 : Col));
     Ref Error = tl::require(PyObject_CallFunction(PyExc_SyntaxError, const_cast<char *>("(O(slOO))"), Msg.get(),
                                                   "<string>", Row + 1, Offset.get(), Text.get()));
     // The 1-based column of the place, whatever CPython's offset says.

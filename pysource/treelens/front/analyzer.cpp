@@ -346,8 +346,8 @@ bool endsInBrackets(PyObject *Logical) {
 
 /// The failure paths of AnalyzeSingleLogical, with an exception pending.
 /// With the syntax checks on, a line that fails at its end inside brackets
-/// gets CPython's message for that (CPython 2 only says so at the top level,
-/// where no block is left open).
+/// gets CPython's message for that (CPython 2 only says so when the line is
+/// the file's first and one physical line long).
 Ref analysisFailed(AnalyzerObject *A, PyObject *Logical) {
   if (PyErr_ExceptionMatches(Host.ParseError)) {
     FetchedError E;
@@ -360,7 +360,8 @@ Ref analysisFailed(AnalyzerObject *A, PyObject *Logical) {
       PyObject *Msg = InvalidSyntax;
       auto *L = reinterpret_cast<host::LogicalLineObject *>(Logical);
       if (A->SyntaxChecks && TokI >= L->TokenCount && endsInBrackets(Logical) &&
-          (L->Indent == 0 || (A->LogicalParser && A->LogicalParser->Py3Grammar)))
+          ((A->LogicalParser && A->LogicalParser->Py3Grammar) ||
+           (L->FirstLine == 0 && L->Positions[L->TokenCount - 1].Row == 0)))
         Msg = UnexpectedEOF;
       return createSyntaxError(Msg, Logical, TokI).release();
     }));
@@ -408,7 +409,8 @@ void inspectSingleLogical(AnalyzerObject *A, PyObject *Logical, bool InAsyncDef,
       return;
   }
   bool Ok = tl::guard<bool>(false, [&] {
-    if (A->SyntaxChecks)
+    // An f-string's expression stands alone here, out of its line and scope.
+    if (A->SyntaxChecks && !InFString)
       checks::checkLine(A->LogicalParser, Tree.get(), Logical, InAsyncDef);
     walker::walk(A->NodeWalker, Tree.get(), Logical);
     hints::walk(A->TypeHintWalker, Tree.get(), Logical);
