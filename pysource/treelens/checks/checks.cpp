@@ -340,14 +340,13 @@ private:
 
   // Statements.
   void stmt(N *X, const Scope &S);
-  void suite(N *X, const Scope &S) { stmt(X, S); }
   void exprStmt(N *X, const Scope &S);
   void annAssign(N *Target, N *Ann, const Scope &S);
-  void forStmt(N *X, const Scope &S, bool Async);
+  void forStmt(N *X, const Scope &S);
   void whileStmt(N *X, const Scope &S);
   void ifStmt(N *X, const Scope &S);
   void tryStmt(N *X, const Scope &S);
-  void withStmt(N *X, const Scope &S, bool Async);
+  void withStmt(N *X, const Scope &S);
   void funcdef(N *X, const Scope &S, bool Async, N *At);
   void classdef(N *X, const Scope &S);
   void importStmt(N *X, const Scope &S, bool Top);
@@ -471,7 +470,7 @@ void Checker::stmt(N *X, const Scope &S) {
       load(child(X, I), S);
     return;
   case Sym::ForStmt:
-    return forStmt(X, S, false);
+    return forStmt(X, S);
   case Sym::WhileStmt:
     return whileStmt(X, S);
   case Sym::IfStmt:
@@ -479,7 +478,7 @@ void Checker::stmt(N *X, const Scope &S) {
   case Sym::TryStmt:
     return tryStmt(X, S);
   case Sym::WithStmt:
-    return withStmt(X, S, false);
+    return withStmt(X, S);
   case Sym::Funcdef:
     return funcdef(X, S, false, X);
   case Sym::AsyncFuncdef:
@@ -494,7 +493,7 @@ void Checker::stmt(N *X, const Scope &S) {
       if (S.B != Block::AsyncFunction)
         report(kCompile, X, symOf(Inner) == Sym::ForStmt ? "'async for' outside async function"
                                                          : "'async with' outside async function");
-      return symOf(Inner) == Sym::ForStmt ? forStmt(Inner, S, true) : withStmt(Inner, S, true);
+      return symOf(Inner) == Sym::ForStmt ? forStmt(Inner, S) : withStmt(Inner, S);
     }
     default:
       return;
@@ -620,7 +619,7 @@ void Checker::annAssign(N *T, N *Ann, const Scope &S) {
     load(child(Ann, I), S);
 }
 
-void Checker::forStmt(N *X, const Scope &S, bool) {
+void Checker::forStmt(N *X, const Scope &S) {
   // 'for' exprlist 'in' testlist ':' suite ['else' ':' suite]
   if (count(X) < 6)
     return;
@@ -629,9 +628,9 @@ void Checker::forStmt(N *X, const Scope &S, bool) {
   Scope Body = S;
   Body.InLoop = true;
   Body.InFinally = false;
-  suite(child(X, 5), Body);
+  stmt(child(X, 5), Body);
   if (count(X) >= 9)
-    suite(child(X, 8), S);
+    stmt(child(X, 8), S);
 }
 
 void Checker::whileStmt(N *X, const Scope &S) {
@@ -641,9 +640,9 @@ void Checker::whileStmt(N *X, const Scope &S) {
   Scope Body = S;
   Body.InLoop = true;
   Body.InFinally = false;
-  suite(child(X, 3), Body);
+  stmt(child(X, 3), Body);
   if (count(X) >= 7)
-    suite(child(X, 6), S);
+    stmt(child(X, 6), S);
 }
 
 void Checker::ifStmt(N *X, const Scope &S) {
@@ -654,7 +653,7 @@ void Checker::ifStmt(N *X, const Scope &S) {
         load(child(X, I + 1), S);
       ++I;
     } else if (!textIs(C, ":") && !textIs(C, "else")) {
-      suite(C, S);
+      stmt(C, S);
     }
   }
 }
@@ -680,19 +679,19 @@ void Checker::tryStmt(N *X, const Scope &S) {
     } else if (textIs(C, "finally")) {
       BS.InFinally = true;
     }
-    suite(Body, BS);
+    stmt(Body, BS);
     I += 2;
   }
 }
 
-void Checker::withStmt(N *X, const Scope &S, bool) {
+void Checker::withStmt(N *X, const Scope &S) {
   for (Py_ssize_t I = 1; I < count(X); ++I) {
     N *C = child(X, I);
-    if (textIs(C, ",") )
+    if (textIs(C, ","))
       continue;
     if (textIs(C, ":")) {
       if (I + 1 < count(X))
-        suite(child(X, I + 1), S);
+        stmt(child(X, I + 1), S);
       return;
     }
     if (symOf(C) == Sym::WithItem && count(C) == 3) {
@@ -721,7 +720,7 @@ void Checker::funcdef(N *X, const Scope &S, bool Async, N *At) {
   Body.NoLoop = true;
   Body.Params = &Names;
   if (I + 1 < count(X))
-    suite(child(X, I + 1), Body);
+    stmt(child(X, I + 1), Body);
 }
 
 void Checker::classdef(N *X, const Scope &S) {
@@ -743,7 +742,7 @@ void Checker::classdef(N *X, const Scope &S) {
   Scope Body{Block::Class, &S};
   Body.NoLoop = true;
   if (I + 1 < count(X))
-    suite(child(X, I + 1), Body);
+    stmt(child(X, I + 1), Body);
 }
 
 void Checker::importStmt(N *X, const Scope &S, bool Top) {
@@ -1527,7 +1526,6 @@ void Checker::parameters(N *X, const Scope &S, std::vector<std::string> &Names, 
   }
   // The parameters in order: names, defaults, the bare '*' rule.
   bool FoundDefault = false, KeywordOnly = false;
-  N *BareStar = nullptr;
   size_t Count = Items.size();
   for (size_t I = 0; I < Count; ++I) {
     N *C = Items[I];
@@ -1537,7 +1535,6 @@ void Checker::parameters(N *X, const Scope &S, std::vector<std::string> &Names, 
       bool Star = textIs(C, "*");
       bool HasName = I + 1 < Count && !textIs(Items[I + 1], ",");
       if (Star && !HasName) {
-        BareStar = C;
         // A bare '*' needs a named parameter after it.
         bool Named = false;
         for (size_t J = I + 1; J < Count; ++J) {
@@ -1585,16 +1582,11 @@ void Checker::parameters(N *X, const Scope &S, std::vector<std::string> &Names, 
       storeName(NameLeaf, NameLeaf, false);
       if (!isLeaf(C) && count(C) == 3)
         load(child(C, 2), S);
-    } else {
-      std::vector<std::string> Inner;
-      paramNames(C, Inner);
-      (void)Inner;
     }
     paramNames(C, Names);
     if (Default)
       I += 2;
   }
-  (void)BareStar;
   for (size_t I = 0; I < Names.size(); ++I) {
     for (size_t J = 0; J < I; ++J) {
       if (Names[I] == Names[J]) {
