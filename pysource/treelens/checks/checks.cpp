@@ -47,6 +47,7 @@ enum class Sym : uint8_t {
   Lambdef,
   StarExpr,
   YieldExpr,
+  NamedExpr, // test ':=' test
   Sequence, // testlist, exprlist, testlist_star_expr, testlist_safe, testlist1
   ExprStmt,
   AnnAssign,
@@ -116,6 +117,7 @@ const SymName SymNames[] = {
     {"old_lambdef", Sym::Lambdef},
     {"star_expr", Sym::StarExpr},
     {"yield_expr", Sym::YieldExpr},
+    {"namedexpr_test", Sym::NamedExpr},
     {"testlist", Sym::Sequence},
     {"exprlist", Sym::Sequence},
     {"testlist_star_expr", Sym::Sequence},
@@ -230,6 +232,15 @@ N *firstLeaf(N *X) {
   return X;
 }
 
+/// A string token with an f prefix.
+inline bool isFString(N *X) {
+  const char *T = text(X);
+  for (; *T && *T != '\'' && *T != '"'; ++T)
+    if (*T == 'f' || *T == 'F')
+      return true;
+  return false;
+}
+
 /// The await keyword (a plain name where the version has no such keyword).
 inline bool isAwait(N *X) {
   return textIs(X, "await") && X->ClsInfo &&
@@ -267,7 +278,11 @@ enum class Kind : uint8_t {
   ListComp,
   SetComp,
   DictComp,
-  Literal, // numbers, strings, dicts and sets
+  Literal, // numbers and strings
+  FString,
+  DictDisplay,
+  SetDisplay,
+  NamedExpr,
   Ellipsis,
   Compare,
   IfExp,
@@ -290,14 +305,23 @@ struct Scope {
   bool InFinally = false;            ///< directly in a finally clause of this line
   std::vector<std::string> *Params = nullptr; ///< parameter names of a def or lambda of this line
   const char *Comprehension = nullptr;         ///< what a comprehension scope builds
+  std::vector<std::string> *IterVars = nullptr; ///< a comprehension's iteration variables
+  bool InIterable = false;                     ///< in the iterable of a comprehension clause
+};
+
+/// How CPython gives the offset of an error.
+enum class Offset : uint8_t {
+  Node,      ///< the node's column: 0-based before 3.8, 1-based from 3.8 on (none in 2.7)
+  LineStart, ///< 0 whatever the node
+  ZeroBased, ///< the node's 0-based column in every version
 };
 
 struct Found {
   bool Set = false;
   std::string Msg;
   Py_ssize_t TokI = 0;
-  int ColDelta = 0;       ///< added to the column of the token (the parser's errors point past a token)
-  bool LineStart = false; ///< CPython gives column 0 whatever the token
+  int ColDelta = 0;  ///< added to the column of the token (the parser's errors point past a token)
+  Offset How = Offset::Node;
 };
 
 class Checker {
@@ -313,6 +337,7 @@ public:
       else
         Minor = static_cast<int>(M);
     }
+    Py38 = Py3 && Minor >= 8;
   }
 
   void run(N *Tree);
@@ -321,11 +346,12 @@ private:
   PyObject *Logical;
   host::LogicalLineObject *L;
   bool Py3;
+  bool Py38 = false; ///< 3.8's messages and 1-based offsets
   int Depth = 0;
   int Minor;
   Found First[kPassCount];
 
-  void report(Pass P, N *At, std::string Msg, int ColDelta = 0, bool LineStart = false) {
+  void report(Pass P, N *At, std::string Msg, int ColDelta = 0, Offset How = Offset::Node) {
     if (First[P].Set)
       return;
     First[P].Set = true;
@@ -334,7 +360,7 @@ private:
     long I = Leaf->Context && PyInt_Check(Leaf->Context) ? PyInt_AS_LONG(Leaf->Context) : 0;
     First[P].TokI = I;
     First[P].ColDelta = ColDelta;
-    First[P].LineStart = LineStart;
+    First[P].How = How;
   }
   void raise();
 
@@ -367,6 +393,8 @@ private:
 
   // Targets.
   Kind kindOf(N *X);
+  std::string exprName(N *X, Kind K, bool Target);
+  void namedExpr(N *X, const Scope &S);
   void target(N *X, bool Del, N *Loc, const Scope &S);
   void setContext(N *X, bool Del, N *Loc);
   void exprlistTargets(N *X, bool Del, const Scope &S);
@@ -593,12 +621,12 @@ void Checker::annAssign(N *T, N *Ann, const Scope &S) {
   switch (kindOf(T)) {
   case Kind::Name:
     if (strcmp(text(E), "__debug__") == 0)
-      report(kAst, T, "assignment to keyword");
+      storeName(E, T, false);
     break;
   case Kind::Attribute: {
     N *Last = child(E, count(E) - 1);
     if (count(Last) == 2 && strcmp(text(child(Last, 1)), "__debug__") == 0)
-      report(kAst, T, "assignment to keyword");
+      storeName(child(Last, 1), T, false);
     break;
   }
   case Kind::Subscript:
@@ -883,6 +911,8 @@ void Checker::load(N *X, const Scope &S) {
     return lambdef(X, S);
   case Sym::YieldExpr:
     return yieldExpr(X, S);
+  case Sym::NamedExpr:
+    return namedExpr(X, S);
   case Sym::StarExpr:
     starred(X, S);
     return load(child(X, 1), S);
@@ -1056,6 +1086,10 @@ void Checker::call(N *Args, const Scope &S) {
       N *Key = child(A, 0);
       load(Key, S);
       Kind K = kindOf(Key);
+      if (K != Kind::Name && Py38) {
+        report(kAst, Key, "expression cannot contain assignment, perhaps you meant \"==\"?");
+        return;
+      }
       if (K == Kind::Lambda) {
         report(kAst, Key, "lambda cannot contain assignment");
         return;
@@ -1104,6 +1138,33 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
                                                                                    : Dict ? "dict comprehension"
                                                                                           : "set comprehension";
   const Scope &CS = NewScope ? Inner : S;
+  // The iteration variables, which an assignment expression may not rebind.
+  std::vector<std::string> Vars;
+  if (Py38) {
+    Inner.IterVars = &Vars;
+    for (N *C = For; C && (symOf(C) == Sym::CompFor || symOf(C) == Sym::SyncCompFor || textIs(child(C, 0), "if"));) {
+      Py_ssize_t I = textIs(child(C, 0), "async") ? 1 : 0;
+      if (count(C) == 2 && symOf(child(C, 1)) == Sym::SyncCompFor) {
+        C = child(C, 1);
+        continue;
+      }
+      if (textIs(child(C, 0), "if")) {
+        C = count(C) > 2 ? child(C, 2) : nullptr;
+        continue;
+      }
+      std::vector<N *> Todo{child(C, I + 1)};
+      while (!Todo.empty()) {
+        N *T = strip(Todo.back());
+        Todo.pop_back();
+        if (symOf(T) == Sym::Name)
+          Vars.push_back(text(T));
+        else if (!isLeaf(T))
+          for (Py_ssize_t J = 0; J < count(T); ++J)
+            Todo.push_back(child(T, J));
+      }
+      C = count(C) > I + 4 ? child(C, I + 4) : nullptr;
+    }
+  }
   // The element first (key and value), then the clauses.
   if (Dict) {
     N *In = child(At, 1);
@@ -1138,7 +1199,9 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
         break;
       exprlistTargets(child(C, I + 1), false, CS);
       // The first iterable is evaluated in the enclosing scope.
-      load(child(C, I + 3), First ? S : CS);
+      Scope Iterable = First ? S : CS;
+      Iterable.InIterable = true;
+      load(child(C, I + 3), Iterable);
       First = false;
       if (count(C) > I + 4)
         Next = child(C, I + 4);
@@ -1156,8 +1219,41 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
     while (F && F->B == Block::Comprehension)
       F = F->Outer ? function(*F->Outer) : nullptr;
     if (F && F->B != Block::AsyncFunction)
-      report(kCompile, At, "asynchronous comprehension outside of an asynchronous function", 0, true);
+      report(kCompile, At, "asynchronous comprehension outside of an asynchronous function", 0, Offset::LineStart);
   }
+}
+
+/// An assignment expression: NAME ':=' test, binding in the enclosing
+/// function whatever comprehensions it sits in.
+void Checker::namedExpr(N *X, const Scope &S) {
+  N *T = child(X, 0);
+  load(T, S);
+  Kind K = kindOf(T);
+  if (K != Kind::Name) {
+    std::string What = exprName(T, K, false);
+    if (!What.empty())
+      report(kAst, X, "cannot use assignment expressions with " + What);
+  } else {
+    setContext(T, false, X);
+    std::string Name = text(strip(T));
+    bool InComprehension = false;
+    const Scope *P = &S;
+    for (; P && P->B == Block::Comprehension; P = P->Outer) {
+      InComprehension = true;
+      if (P->IterVars)
+        for (const std::string &V : *P->IterVars)
+          if (V == Name) {
+            report(kSymtable, X, "assignment expression cannot rebind comprehension iteration variable '" + Name + "'",
+                   0, Offset::ZeroBased);
+            return load(child(X, 2), S);
+          }
+    }
+    if (S.InIterable)
+      report(kSymtable, X, "assignment expression cannot be used in a comprehension iterable expression");
+    else if (InComprehension && P && P->B == Block::Class)
+      report(kSymtable, X, "assignment expression within a comprehension cannot be used in a class body");
+  }
+  load(child(X, 2), S);
 }
 
 void Checker::lambdef(N *X, const Scope &S) {
@@ -1197,8 +1293,9 @@ Kind Checker::kindOf(N *X) {
     case Sym::Name:
       return Kind::Name;
     case Sym::Number:
-    case Sym::String:
       return Kind::Literal;
+    case Sym::String:
+      return isFString(X) ? Kind::FString : Kind::Literal;
     case Sym::Keyword:
       if (textIs(X, "yield"))
         return Kind::Yield;
@@ -1215,12 +1312,16 @@ Kind Checker::kindOf(N *X) {
   switch (symOf(X)) {
   case Sym::Atom: {
     N *Open = child(X, 0);
-    if (symOf(Open) == Sym::String)
+    if (symOf(Open) == Sym::String) {
+      for (Py_ssize_t I = 0; I < Count; ++I)
+        if (isFString(child(X, I)))
+          return Kind::FString;
       return Kind::Literal;
+    }
     if (textIs(Open, "`"))
       return Kind::Repr;
     if (Count == 2)
-      return textIs(Open, "(") ? Kind::EmptyTuple : textIs(Open, "[") ? Kind::List : Kind::Literal;
+      return textIs(Open, "(") ? Kind::EmptyTuple : textIs(Open, "[") ? Kind::List : Kind::DictDisplay;
     if (Count != 3)
       return Kind::Other;
     N *In = child(X, 1);
@@ -1251,7 +1352,7 @@ Kind Checker::kindOf(N *X) {
       return Comp ? Kind::ListComp : Kind::List;
     if (Comp)
       return Dict ? Kind::DictComp : Kind::SetComp;
-    return Kind::Literal;
+    return Dict ? Kind::DictDisplay : Kind::SetDisplay;
   }
   case Sym::AtomExpr: {
     if (isAwait(child(X, 0)))
@@ -1280,6 +1381,8 @@ Kind Checker::kindOf(N *X) {
     return Kind::Starred;
   case Sym::YieldExpr:
     return Kind::Yield;
+  case Sym::NamedExpr:
+    return Kind::NamedExpr;
   case Sym::Sequence:
     return Kind::Tuple;
   default:
@@ -1288,7 +1391,7 @@ Kind Checker::kindOf(N *X) {
 }
 
 /// The message of a subtree that cannot be assigned or deleted, or nullptr.
-const char *unassignable(Kind K, bool Py3) {
+std::string Checker::exprName(N *X, Kind K, bool Target) {
   switch (K) {
   case Kind::Lambda:
     return "lambda";
@@ -1310,8 +1413,14 @@ const char *unassignable(Kind K, bool Py3) {
     return "dict comprehension";
   case Kind::Literal:
     return "literal";
+  case Kind::FString:
+    return Py38 ? "f-string expression" : "literal";
+  case Kind::DictDisplay:
+    return Py38 ? "dict display" : "literal";
+  case Kind::SetDisplay:
+    return Py38 ? "set display" : "literal";
   case Kind::NameConstant:
-    return "keyword";
+    return Py38 ? text(strip(X)) : "keyword";
   case Kind::Ellipsis:
     return "Ellipsis";
   case Kind::Compare:
@@ -1320,10 +1429,23 @@ const char *unassignable(Kind K, bool Py3) {
     return "conditional expression";
   case Kind::Repr:
     return "repr";
+  case Kind::NamedExpr:
+    return "named expression";
   case Kind::EmptyTuple:
-    return Py3 ? nullptr : "()";
+    return Target ? (Py3 ? "" : "()") : "tuple";
+  // Only an assignment expression's target names these.
+  case Kind::Attribute:
+    return Target ? "" : "attribute";
+  case Kind::Subscript:
+    return Target ? "" : "subscript";
+  case Kind::Starred:
+    return Target ? "" : "starred";
+  case Kind::List:
+    return Target ? "" : "list";
+  case Kind::Tuple:
+    return Target ? "" : "tuple";
   default:
-    return nullptr;
+    return "";
   }
 }
 
@@ -1333,7 +1455,7 @@ void Checker::storeName(N *NameLeaf, N *Loc, bool FullChecks) {
   if (Py3) {
     if (strcmp(T, "__debug__") == 0 ||
         (FullChecks && (strcmp(T, "None") == 0 || strcmp(T, "True") == 0 || strcmp(T, "False") == 0)))
-      report(kAst, Loc, "assignment to keyword");
+      report(kAst, Loc, Py38 ? std::string("cannot assign to ") + T : std::string("assignment to keyword"));
   } else if (strcmp(T, "None") == 0 || strcmp(T, "__debug__") == 0) {
     report(kAst, Loc, std::string("cannot assign to ") + T);
   }
@@ -1376,8 +1498,10 @@ void Checker::setContext(N *X, bool Del, N *Loc) {
   default:
     break;
   }
-  if (const char *What = unassignable(K, Py3))
-    report(kAst, Loc, std::string(Del ? "can't delete " : "can't assign to ") + What);
+  std::string What = exprName(X, K, true);
+  if (!What.empty())
+    report(kAst, Loc, std::string(Py38 ? (Del ? "cannot delete " : "cannot assign to ")
+                                       : (Del ? "can't delete " : "can't assign to ")) + What);
 }
 
 /// The items of a list or tuple target (or the target itself).
@@ -1613,14 +1737,16 @@ void Checker::raise() {
     Ref Msg = tl::require(PyString_FromStringAndSize(F.Msg.data(), static_cast<Py_ssize_t>(F.Msg.size())));
     // CPython 2 gives no column for these errors; CPython 3 the node's 0-based
     // column (the parser's own errors, a 1-based one).
-    Ref Offset = Ref::borrow(Py_None);
+    Ref OffsetObj = Ref::borrow(Py_None);
     long Column = Col + 1 + F.ColDelta;
     if (P == kParse)
-      Offset = tl::require(PyInt_FromLong(Col + 1 + F.ColDelta));
+      OffsetObj = tl::require(PyInt_FromLong(Col + 1 + F.ColDelta));
     else if (Py3)
-      Offset = tl::require(PyInt_FromLong(F.LineStart ? 0 : Col));
+      OffsetObj = tl::require(PyInt_FromLong(F.How == Offset::LineStart ? 0
+                                          : F.How == Offset::ZeroBased || !Py38 ? Col
+                                                                              : Col + 1));
     Ref Error = tl::require(PyObject_CallFunction(PyExc_SyntaxError, const_cast<char *>("(O(slOO))"), Msg.get(),
-                                                  "<string>", Row + 1, Offset.get(), Text.get()));
+                                                  "<string>", Row + 1, OffsetObj.get(), Text.get()));
     // The 1-based column of the place, whatever CPython's offset says.
     Ref ColumnObj = tl::require(PyInt_FromLong(Column));
     tl::requireStatus(PyObject_SetAttrString(Error.get(), "column", ColumnObj.get()));
