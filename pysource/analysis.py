@@ -173,6 +173,26 @@ def TokenError(version, logical):
     return None
 
 
+kCommentKind, kBlankKind = 21, 22
+_kOpening = (7, 9, 26)   # ( [ {
+_kClosing = (8, 10, 27)
+
+
+def _LexedFirst(logical, found, error):
+    """Whether CPython reports the lexer's error found = (token index, message)
+    before the analyzer's error: the lexer's come while parsing, so before the
+    errors of the checks after parsing and before a parse error further on;
+    a bad escape in a string comes once the line has parsed.
+    """
+    row, col = logical.fTokens[found[0]][1]
+    if hasattr(error, 'column'):          # an error of the checks after parsing
+        # but for '<>' under 3.x, which they place past the token as CPython does
+        return error.msg != 'invalid syntax' or (row + 1, col + 1) < (error.lineno, error.column - 1)
+    if found[1].startswith('(unicode error)'):
+        return False
+    return (row + 1, col + 1) <= (error.lineno, error.offset)
+
+
 class VersionAnalyzer(object):
     """Analyzes the logical lines of modules in one language version."""
 
@@ -213,9 +233,9 @@ class VersionAnalyzer(object):
         if logical.fInspected:
             logical.fInspected = False
         error = impl.AnalyzeSingleLogical(logical, self._py3 and utils.InAsyncDef(logical))
-        if error is None:
+        if error is None or self.checks:
             found = TokenError(self.version, logical)
-            if found is not None:
+            if found is not None and (error is None or _LexedFirst(logical, found, error)):
                 from pysource import treelens
                 _fastaccess.ClearLogicalDerivedInfo(logical)
                 error = treelens.CreateSyntaxError(found[1], logical, found[0])
@@ -233,7 +253,40 @@ class VersionAnalyzer(object):
             errors.append(error)
             if error is not None and stop_at_error:
                 break
+        if self.checks and errors and errors[-1] is not None:
+            self._EndOfFile(logicals, errors)
         return errors
+
+    def _EndOfFile(self, logicals, errors):
+        """CPython's message for a file that ends inside brackets.
+
+        The last line with tokens failed at its end with brackets open: the
+        language's tokenizer reached the end of the file there. (CPython 2
+        only says so when that line is the file's first and one physical line
+        long.)
+        """
+        last = len(logicals) - 1
+        while last >= 0 and logicals[last].fKind in (kCommentKind, kBlankKind):
+            last -= 1
+        if not 0 <= last < len(errors) or errors[last] is None or errors[last].msg != 'invalid syntax':
+            return
+        logical, error = logicals[last], errors[last]
+        (text, (row, col)) = logical.fTokens[-1]
+        if (error.lineno, error.offset) != (row + 1, col + len(text) + 1):
+            return
+        if not self._py3 and (logical.fFirstLine != 0 or row != 0):
+            return
+        depth = 0
+        for i in range(logical.fTokenCount):
+            code = _fastaccess.GetLogicalTokenType(logical, i)
+            if code in _kOpening:
+                depth += 1
+            elif code in _kClosing and depth:
+                depth -= 1
+        if depth:
+            from pysource import treelens
+            errors[last] = treelens.CreateSyntaxError('unexpected EOF while parsing', logical,
+                                                      logical.fTokenCount)
 
 
 _gAnalyzers = {}

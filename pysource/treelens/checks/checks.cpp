@@ -941,7 +941,25 @@ void Checker::elements(N *X, const Scope &S, bool StarOk) {
 
 void Checker::starred(N *X, const Scope &) { report(kCompile, X, "can't use starred expression here"); }
 
+/// A string token with a b prefix.
+inline bool isBytes(N *X) {
+  const char *T = text(X);
+  for (; *T && *T != '\'' && *T != '"'; ++T)
+    if (*T == 'b' || *T == 'B')
+      return true;
+  return false;
+}
+
 void Checker::atom(N *X, const Scope &S) {
+  if (symOf(child(X, 0)) == Sym::String) {
+    // Adjacent literals join into one: Python 3 cannot join bytes and text.
+    int Bytes = 0;
+    for (Py_ssize_t I = 0; I < count(X); ++I)
+      Bytes += isBytes(child(X, I));
+    if (Py3 && Bytes && Bytes < count(X))
+      report(kAst, X, "cannot mix bytes and nonbytes literals");
+    return;
+  }
   if (count(X) != 3 || !isLeaf(child(X, 0))) {
     for (Py_ssize_t I = 0; I < count(X); ++I)
       load(child(X, I), S);
@@ -1368,10 +1386,14 @@ Kind Checker::kindOf(N *X) {
   }
   case Sym::Test:
     return Count >= 2 && textIs(child(X, 1), "if") ? Kind::IfExp : Kind::Other;
+  case Sym::Factor:
+    // Python 2 folds a negated number into the number.
+    if (!Py3 && Count == 2 && textIs(child(X, 0), "-") && symOf(child(X, 1)) == Sym::Number)
+      return Kind::Literal;
+    return Kind::Operator;
   case Sym::OrAnd:
   case Sym::NotTest:
   case Sym::BinOp:
-  case Sym::Factor:
     return Kind::Operator;
   case Sym::Comparison:
     return Kind::Compare;

@@ -23,7 +23,6 @@ PyTypeObject AnalyzerType;
 /// kPy3DefaultGrammar as it was when the class was defined.
 PyObject *DefaultGrammar;
 PyObject *InvalidSyntax;
-PyObject *UnexpectedEOF;
 
 AnalyzerObject *self(PyObject *O) { return reinterpret_cast<AnalyzerObject *>(O); }
 
@@ -324,31 +323,8 @@ PyGetSetDef AnalyzerGetSets[] = {
      const_cast<char *>("whether lines are also checked as CPython checks them after parsing"), nullptr},
     {nullptr, nullptr, nullptr, nullptr, nullptr}};
 
-/// Whether a logical ends inside brackets: the language's tokenizer then
-/// reaches the end of the file, and the parser says so.
-bool endsInBrackets(PyObject *Logical) {
-  auto *L = reinterpret_cast<host::LogicalLineObject *>(Logical);
-  long Depth = 0;
-  for (Py_ssize_t I = 0; I < L->TokenCount; ++I) {
-    switch (L->Types[I]) {
-    case 7: case 9: case 26: // ( [ {
-      ++Depth;
-      break;
-    case 8: case 10: case 27: // ) ] }
-      Depth = Depth > 0 ? Depth - 1 : 0;
-      break;
-    default:
-      break;
-    }
-  }
-  return Depth > 0;
-}
-
 /// The failure paths of AnalyzeSingleLogical, with an exception pending.
-/// With the syntax checks on, a line that fails at its end inside brackets
-/// gets CPython's message for that (CPython 2 only says so when the line is
-/// the file's first and one physical line long).
-Ref analysisFailed(AnalyzerObject *A, PyObject *Logical) {
+Ref analysisFailed(PyObject *Logical) {
   if (PyErr_ExceptionMatches(Host.ParseError)) {
     FetchedError E;
     Ref Result = Ref::steal(tl::guard<PyObject *>(nullptr, [&] {
@@ -357,13 +333,7 @@ Ref analysisFailed(AnalyzerObject *A, PyObject *Logical) {
       Py_ssize_t TokI = PyNumber_AsSsize_t(Context.get(), PyExc_OverflowError);
       if (TokI == -1 && PyErr_Occurred())
         throw tl::PyErrSet();
-      PyObject *Msg = InvalidSyntax;
-      auto *L = reinterpret_cast<host::LogicalLineObject *>(Logical);
-      if (A->SyntaxChecks && TokI >= L->TokenCount && endsInBrackets(Logical) &&
-          ((A->LogicalParser && A->LogicalParser->Py3Grammar) ||
-           (L->FirstLine == 0 && L->Positions[L->TokenCount - 1].Row == 0)))
-        Msg = UnexpectedEOF;
-      return createSyntaxError(Msg, Logical, TokI).release();
+      return createSyntaxError(InvalidSyntax, Logical, TokI).release();
     }));
     if (Result)
       return Result;
@@ -396,7 +366,7 @@ Ref analyzeSingleLogical(AnalyzerObject *A, PyObject *Logical, bool InAsyncDef) 
     inspectSingleLogical(A, Logical, InAsyncDef, false);
     return true;
   });
-  return Ok ? Ref::borrow(Py_None) : analysisFailed(A, Logical);
+  return Ok ? Ref::borrow(Py_None) : analysisFailed(Logical);
 }
 
 void inspectSingleLogical(AnalyzerObject *A, PyObject *Logical, bool InAsyncDef, bool InFString) {
@@ -446,7 +416,6 @@ int initAnalyzerType(PyObject *Module) {
   return tl::guard<int>(-1, [&] {
     DefaultGrammar = tl::require(PyObject_GetAttrString(Module, "kPy3DefaultGrammar")).release();
     InvalidSyntax = tl::internName("invalid syntax");
-    UnexpectedEOF = tl::internName("unexpected EOF while parsing");
     tl::TypeDesc D;
     D.Name = "pysource.treelens.CPGenAnalyzerImpl";
     D.Doc = "Analyzes logical using a parser implemented via the pgen2 package";
