@@ -178,6 +178,39 @@ _kOpening = (7, 9, 26)   # ( [ {
 _kClosing = (8, 10, 27)
 
 
+def _LegacyStatementError(version, logical, error):
+    """The error with CPython 3's message for a line that uses print or exec as
+    a statement: CPython rewrites any syntax error on a line with no '(' that
+    starts with 'print ' or 'exec ' (or has it after its first colon)."""
+    lines = logical.fLineText.splitlines(True)
+    row = (error.lineno or 1) - 1
+    line = lines[row] if 0 <= row < len(lines) else b''
+    if b'(' in line:
+        return error
+    message = _LegacyMessage(version, line, 0)
+    if message is None and b':' in line:
+        message = _LegacyMessage(version, line, line.index(b':') + 1)
+    if message is None:
+        return error
+    rewritten = SyntaxError(message, (error.filename, error.lineno, error.offset, error.text))
+    if hasattr(error, 'column'):
+        rewritten.column = error.column
+    return rewritten
+
+
+def _LegacyMessage(version, line, start):
+    rest = line[start:].lstrip(b' \t\r\n\x0b\x0c')
+    if rest.startswith(b'print '):
+        if version == '3.5':
+            return "Missing parentheses in call to 'print'"
+        data = rest[6:].strip(b' \t\r\n')
+        return ("Missing parentheses in call to 'print'. Did you mean print(%s%s)?"
+                % (data, ' end=" "' if data.endswith(b',') else ''))
+    if rest.startswith(b'exec '):
+        return "Missing parentheses in call to 'exec'"
+    return None
+
+
 def _LexedFirst(logical, found, error):
     """Whether CPython reports the lexer's error found = (token index, message)
     before the analyzer's error: the lexer's come while parsing, so before the
@@ -239,6 +272,8 @@ class VersionAnalyzer(object):
                 from pysource import treelens
                 _fastaccess.ClearLogicalDerivedInfo(logical)
                 error = treelens.CreateSyntaxError(found[1], logical, found[0])
+        if error is not None and self.checks and self._py3:
+            error = _LegacyStatementError(self.version, logical, error)
         return error
 
     def Analyze(self, logicals, stop_at_error=False, impl=None):

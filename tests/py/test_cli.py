@@ -85,7 +85,8 @@ class CliTest(unittest.TestCase):
                                     '-', self.tmp,
                                     '--stdin-filename', 'in.py', stdin=b'\n\nprint x\n')
         self.assertEqual(status, 2)
-        self.assertEqual(out, b'in.py:3:7: invalid syntax\n' + bad + b':1:7: invalid syntax\n')
+        self.assertEqual(out, b"in.py:3:7: Missing parentheses in call to 'print'. Did you mean print(x)?\n" +
+                         bad + b':1:7: invalid syntax\n')
         self.assertEqual(err.splitlines(), [
             b'missing.py: error: cannot read: No such file or directory',
             binary + b': error: not Python source: NUL byte at line 2, column 5',
