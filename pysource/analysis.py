@@ -297,8 +297,7 @@ class VersionAnalyzer(object):
 
         The last line with tokens failed at its end with brackets open: the
         language's tokenizer reached the end of the file there. (CPython 2
-        only says so when that line is the file's first and one physical line
-        long.)
+        only says so when the file is that one physical line.)
         """
         last = len(logicals) - 1
         while last >= 0 and logicals[last].fKind in (kCommentKind, kBlankKind):
@@ -309,7 +308,8 @@ class VersionAnalyzer(object):
         (text, (row, col)) = logical.fTokens[-1]
         if (error.lineno, error.offset) != (row + 1, col + len(text) + 1):
             return
-        if not self._py3 and (logical.fFirstLine != 0 or row != 0):
+        if not self._py3 and (logical.fFirstLine != 0 or row != 0 or last != len(logicals) - 1
+                              or logical.fLineText.count(b'\n') > 1):
             return
         depth = 0
         for i in range(logical.fTokenCount):

@@ -17,6 +17,11 @@ kNo = 'not for this version'
 kMutants = 2000 if support.kSanitized else 20000
 
 kCases = [
+    ('print x', None, ("Missing parentheses in call to 'print'. Did you mean print(x)?", 1, 7)),
+    ('if x: print y,', None, ('Missing parentheses in call to \'print\'. Did you mean print(y, end=" ")?', 1, 13)),
+    ('x = b"a" "b"', None, ('cannot mix bytes and nonbytes literals', 1, 4)),
+    ('[-1] = x', ("can't assign to literal", 1, None), ("can't assign to operator", 1, 0)),
+    ('x = f(a,\n  b', ('invalid syntax', 2, 4), ('unexpected EOF while parsing', 2, 4)),
     ('f() = 1', ("can't assign to function call", 1, None), ("can't assign to function call", 1, 0)),
     ('a, (b, g(x)) = 1', ("can't assign to function call", 1, None), ("can't assign to function call", 1, 0)),
     ('None = 1', ('cannot assign to None', 1, None), ("can't assign to keyword", 1, 0)),
