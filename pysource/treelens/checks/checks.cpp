@@ -1104,9 +1104,13 @@ void Checker::call(N *Args, const Scope &S) {
       N *Key = child(A, 0);
       load(Key, S);
       Kind K = kindOf(Key);
-      if (K != Kind::Name && Py38) {
-        report(kAst, Key, "expression cannot contain assignment, perhaps you meant \"==\"?");
-        return;
+      if (Py38) {
+        // 3.8 wants the NAME token itself (None, True and False are names to it).
+        if (symOf(Key) != Sym::Name && symOf(Key) != Sym::Keyword) {
+          report(kAst, Key, "expression cannot contain assignment, perhaps you meant \"==\"?");
+          return;
+        }
+        K = Kind::Name;
       }
       if (K == Kind::Lambda) {
         report(kAst, Key, "lambda cannot contain assignment");
@@ -1117,7 +1121,7 @@ void Checker::call(N *Args, const Scope &S) {
         return;
       }
       N *KeyName = strip(Key);
-      storeName(KeyName, Py3 ? A : Key, true);
+      storeName(KeyName, Py3 && !Py38 ? A : Key, true);
       for (const std::string &Prev : Names) {
         if (Prev == text(KeyName)) {
           report(kAst, Key, "keyword argument repeated");
