@@ -162,20 +162,49 @@ def TokenError(version, logical):
     and \\u escapes that are not four hex digits in text strings; 3.5 also
     f-strings and underscores in numbers; 2.7 rejects those two and rb''.
     """
+    found = None
     hint, check = _kTokenChecks[version]
-    if not hint.search(logical.fLineText):
-        return None
-    for i in range(logical.fTokenCount):
-        text = logical.GetTokenString(i)
-        message = check(text, _fastaccess.GetTokenType(text), version)
-        if message is not None:
-            return i, message
-    return None
+    if hint.search(logical.fLineText):
+        for i in range(logical.fTokenCount):
+            text = logical.GetTokenString(i)
+            message = check(text, _fastaccess.GetTokenType(text), version)
+            if message is not None:
+                found = i, message
+                break
+    if version in _kBracketsChecked:
+        bracket = _BracketError(logical, found[0] if found else logical.fTokenCount)
+        found = bracket or found
+    return found
 
 
 kCommentKind, kBlankKind = 21, 22
 _kOpening = (7, 9, 26)   # ( [ {
 _kClosing = (8, 10, 27)
+# Versions whose lexer matches brackets and says which do not pair.
+_kBracketsChecked = ('3.8',)
+
+
+def _BracketError(logical, end):
+    """(token index, message) of the first closing bracket before token `end`
+    that does not close the last open one, or None."""
+    if not any(c in logical.fLineText for c in b')]}'):
+        return None
+    stack = []
+    for i in range(end):
+        code = _fastaccess.GetLogicalTokenType(logical, i)
+        if code in _kOpening:
+            stack.append(i)
+        elif code in _kClosing:
+            close = logical.GetTokenString(i)
+            if not stack:
+                return i, "unmatched '%s'" % close
+            j = stack.pop()
+            if _kOpening.index(_fastaccess.GetLogicalTokenType(logical, j)) != _kClosing.index(code):
+                open_, row = logical.GetTokenString(j), logical.fTokens[j][1][0]
+                where = '' if row == logical.fTokens[i][1][0] else ' on line %d' % (logical.fFirstLine + row + 1)
+                return i, ("closing parenthesis '%s' does not match opening parenthesis '%s'%s"
+                           % (close, open_, where))
+    return None
 
 
 def _LegacyStatementError(version, logical, error):
