@@ -368,8 +368,7 @@ private:
   void stmt(N *X, const Scope &S);
   void exprStmt(N *X, const Scope &S);
   void annAssign(N *Target, N *Ann, const Scope &S);
-  void forStmt(N *X, const Scope &S);
-  void whileStmt(N *X, const Scope &S);
+  void loopStmt(N *X, const Scope &S);
   void ifStmt(N *X, const Scope &S);
   void tryStmt(N *X, const Scope &S);
   void withStmt(N *X, const Scope &S);
@@ -498,9 +497,8 @@ void Checker::stmt(N *X, const Scope &S) {
       load(child(X, I), S);
     return;
   case Sym::ForStmt:
-    return forStmt(X, S);
   case Sym::WhileStmt:
-    return whileStmt(X, S);
+    return loopStmt(X, S);
   case Sym::IfStmt:
     return ifStmt(X, S);
   case Sym::TryStmt:
@@ -521,7 +519,7 @@ void Checker::stmt(N *X, const Scope &S) {
       if (S.B != Block::AsyncFunction)
         report(kCompile, X, symOf(Inner) == Sym::ForStmt ? "'async for' outside async function"
                                                          : "'async with' outside async function");
-      return symOf(Inner) == Sym::ForStmt ? forStmt(Inner, S) : withStmt(Inner, S);
+      return symOf(Inner) == Sym::ForStmt ? loopStmt(Inner, S) : withStmt(Inner, S);
     }
     default:
       return;
@@ -647,30 +645,25 @@ void Checker::annAssign(N *T, N *Ann, const Scope &S) {
     load(child(Ann, I), S);
 }
 
-void Checker::forStmt(N *X, const Scope &S) {
-  // 'for' exprlist 'in' testlist ':' suite ['else' ':' suite]
-  if (count(X) < 6)
+/// for and while: the header, the body inside the loop, the else clause outside.
+void Checker::loopStmt(N *X, const Scope &S) {
+  // 'for' exprlist 'in' testlist ':' suite ['else' ':' suite], 'while' test ':' suite [...]
+  bool For = textIs(child(X, 0), "for");
+  Py_ssize_t Body = For ? 5 : 3;
+  if (count(X) <= Body)
     return;
-  exprlistTargets(child(X, 1), false, S);
-  load(child(X, 3), S);
-  Scope Body = S;
-  Body.InLoop = true;
-  Body.InFinally = false;
-  stmt(child(X, 5), Body);
-  if (count(X) >= 9)
-    stmt(child(X, 8), S);
-}
-
-void Checker::whileStmt(N *X, const Scope &S) {
-  if (count(X) < 4)
-    return;
-  load(child(X, 1), S);
-  Scope Body = S;
-  Body.InLoop = true;
-  Body.InFinally = false;
-  stmt(child(X, 3), Body);
-  if (count(X) >= 7)
-    stmt(child(X, 6), S);
+  if (For) {
+    exprlistTargets(child(X, 1), false, S);
+    load(child(X, 3), S);
+  } else {
+    load(child(X, 1), S);
+  }
+  Scope InLoop = S;
+  InLoop.InLoop = true;
+  InLoop.InFinally = false;
+  stmt(child(X, Body), InLoop);
+  if (count(X) > Body + 3)
+    stmt(child(X, Body + 3), S);
 }
 
 void Checker::ifStmt(N *X, const Scope &S) {
