@@ -192,7 +192,18 @@ inline N *child(N *X, Py_ssize_t I) {
 
 /// The leaf's text ("" when it has none).
 inline const char *text(N *X) { return X->Text && PyString_Check(X->Text) ? PyString_AS_STRING(X->Text) : ""; }
-inline bool textIs(N *X, const char *T) { return isLeaf(X) && strcmp(text(X), T) == 0; }
+inline bool textIs(N *X, const char *T) {
+  if (!isLeaf(X))
+    return false;
+  const char *Text = text(X);
+  return Text[0] == T[0] && strcmp(Text, T) == 0;
+}
+
+/// The keyword leaves' class (the analyzer's node classes are fixed once made).
+inline PyTypeObject *keywordType() {
+  static PyTypeObject *Type = &nodeType(NodeClass::CKeywordLiteral);
+  return Type;
+}
 
 Sym symOf(N *X) {
   ClassInfoObject *Info = X->ClsInfo;
@@ -201,7 +212,7 @@ Sym symOf(N *X) {
   if (isLeaf(X)) {
     switch (Info->NodeType) {
     case kName:
-      return Py_TYPE(X) == &nodeType(NodeClass::CKeywordLiteral) ? Sym::Keyword : Sym::Name;
+      return Py_TYPE(X) == keywordType() ? Sym::Keyword : Sym::Name;
     case kNumber:
       return Sym::Number;
     case kString:
@@ -244,7 +255,7 @@ inline bool isFString(N *X) {
 /// The await keyword (a plain name where the version has no such keyword).
 inline bool isAwait(N *X) {
   return textIs(X, "await") && X->ClsInfo &&
-         (X->ClsInfo->NodeType == kAwait || Py_TYPE(X) == &nodeType(NodeClass::CKeywordLiteral));
+         (X->ClsInfo->NodeType == kAwait || Py_TYPE(X) == keywordType());
 }
 
 /// The expression inside grouping parentheses: (x) is x, but (x,), (x for
