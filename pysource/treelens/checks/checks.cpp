@@ -316,6 +316,7 @@ struct Scope {
   bool InFinally = false;            ///< directly in a finally clause of this line
   std::vector<std::string> *Params = nullptr; ///< parameter names of a def or lambda of this line
   const char *Comprehension = nullptr;         ///< what a comprehension scope builds
+  N *ComprehensionAt = nullptr;                ///< the comprehension, where CPython places its errors
   std::vector<std::string> *IterVars = nullptr; ///< a comprehension's iteration variables
   bool InIterable = false;                     ///< in the iterable of a comprehension clause
 };
@@ -1159,6 +1160,7 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
   bool NewScope = Py3 || !List;
   Scope Inner{Block::Comprehension, &S};
   Inner.NoLoop = true;
+  Inner.ComprehensionAt = At;
   Inner.Comprehension = List ? "list comprehension"
                              : symOf(At) != Sym::Atom || textIs(child(At, 0), "(") ? "generator expression"
                                                                                    : Dict ? "dict comprehension"
@@ -1275,9 +1277,11 @@ void Checker::namedExpr(N *X, const Scope &S) {
           }
     }
     if (S.InIterable)
-      report(kSymtable, X, "assignment expression cannot be used in a comprehension iterable expression");
+      report(kSymtable, X, "assignment expression cannot be used in a comprehension iterable expression", 0,
+             Offset::ZeroBased);
     else if (InComprehension && P && P->B == Block::Class)
-      report(kSymtable, X, "assignment expression within a comprehension cannot be used in a class body");
+      report(kSymtable, X, "assignment expression within a comprehension cannot be used in a class body", 0,
+             Offset::ZeroBased);
   }
   load(child(X, 2), S);
 }
@@ -1296,7 +1300,7 @@ void Checker::yieldExpr(N *X, const Scope &S) {
   if (S.B == Block::Module || S.B == Block::Class) {
     report(kCompile, X, "'yield' outside function");
   } else if (Py3 && Minor >= 8 && S.B == Block::Comprehension) {
-    report(kSymtable, X, std::string("'yield' inside ") + S.Comprehension);
+    report(kSymtable, S.ComprehensionAt, std::string("'yield' inside ") + S.Comprehension);
   } else if (Py3 && S.B == Block::AsyncFunction && !isLeaf(X) && count(X) == 2 &&
              !isLeaf(child(X, 1)) && count(child(X, 1)) == 2 && textIs(child(child(X, 1), 0), "from")) {
     report(kCompile, X, "'yield from' inside async function");
