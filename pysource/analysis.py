@@ -9,7 +9,7 @@
     for result in analysis.AnalyzeFolder('src'):              # 'auto' by default
         print(result.path, result.version, result.status, len(result.SyntaxErrors()))
 
-A version is '2.7', '3.5', '3.6' or 'auto'. Each version has one analyzer
+A version is '2.7', '3.5', '3.6', '3.7', '3.8' or 'auto'. Each version has one analyzer
 with its grammar, keyword list and the Python 3 hint grammar; a 2.7 module that
 imports print_function from __future__ gets the 2.7 grammar variant without
 the print statement. 'auto' picks, per file, the newest version under which no
@@ -28,10 +28,10 @@ from pysource import _fastaccess
 from pysource import symbolinfo
 from pysource import utils
 
-kVersions = ('2.7', '3.5', '3.6')
+kVersions = ('2.7', '3.5', '3.6', '3.7', '3.8')
 kAuto = 'auto'
 # The order in which 'auto' tries the versions.
-kAutoOrder = ('3.6', '3.5', '2.7')
+kAutoOrder = ('3.8', '3.7', '3.6', '3.5', '2.7')
 kSourceSuffixes = ('.py', '.pyi')
 
 # The grammar of type hints is a Python 3 one whatever the version of the code.
@@ -44,13 +44,21 @@ kPy3Keywords = (
     'def', 'del', 'elif', 'else', 'except', 'finally', 'for', 'from', 'global',
     'if', 'import', 'in', 'is', 'lambda', 'nonlocal', 'not', 'or', 'pass',
     'raise', 'return', 'try', 'while', 'with', 'yield')
+# From 3.7 on async and await are keywords everywhere.
+kPy37Keywords = tuple(sorted(kPy3Keywords + ('async', 'await')))
 
 # Version -> (version triple, grammar file, Python 3 grammar).
 kGrammars = {
     '2.7': ((2, 7, 0), 'Python-Grammar-2.7', False),
     '3.5': ((3, 5, 0), 'Python-Grammar-3.5', True),
     '3.6': ((3, 6, 0), 'Python-Grammar-3.6', True),
+    '3.7': ((3, 7, 0), 'Python-Grammar-3.7', True),
+    '3.8': ((3, 8, 0), 'Python-Grammar-3.8', True),
 }
+
+# Version -> keyword list of a Python 3 version.
+kKeywords = {'3.5': kPy3Keywords, '3.6': kPy3Keywords,
+             '3.7': kPy37Keywords, '3.8': kPy37Keywords}
 
 kKindNames = {0: 'stmt', 1: 'class', 2: 'def', 11: 'try', 21: 'comment', 22: 'blank'}
 
@@ -152,6 +160,8 @@ _kTokenChecks = {
     '2.7': (re.compile(br'[0-9]_|[fF][rR]?[\'"]|[rR][fFbB][\'"]'), _Py2TokenError),
     '3.5': (re.compile(_kPy3Hint + br'|[0-9]_|[fF][rRbB]?[\'"]'), _Py3TokenError),
     '3.6': (re.compile(_kPy3Hint), _Py3TokenError),
+    '3.7': (re.compile(_kPy3Hint), _Py3TokenError),
+    '3.8': (re.compile(_kPy3Hint), _Py3TokenError),
 }
 
 
@@ -191,7 +201,7 @@ class VersionAnalyzer(object):
         if impl is None:
             from pysource import treelens
             if self._py3:
-                grammar, keywords = self._grammar, list(kPy3Keywords)
+                grammar, keywords = self._grammar, list(kKeywords[self.version])
             elif key:
                 import keyword
                 grammar = kPrintFunctionGrammar
@@ -239,7 +249,7 @@ _gAnalyzers = {}
 
 
 def GetAnalyzer(version):
-    """The VersionAnalyzer of a version ('2.7', '3.5' or '3.6'), made once per process."""
+    """The VersionAnalyzer of a version (one of kVersions), made once per process."""
     analyzer = _gAnalyzers.get(version)
     if analyzer is None:
         analyzer = _gAnalyzers[version] = VersionAnalyzer(version)
