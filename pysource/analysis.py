@@ -9,10 +9,10 @@
     for result in analysis.AnalyzeFolder('src'):              # 'auto' by default
         print(result.path, result.version, result.status, len(result.SyntaxErrors()))
 
-A version is '2.7', '3.5', '3.6', '3.7', '3.8' or 'auto'. Each version has one analyzer
-with its grammar, keyword list and the Python 3 hint grammar; a 2.7 module that
-imports print_function from __future__ gets the 2.7 grammar variant without
-the print statement. 'auto' picks, per file, the newest version under which no
+A version is '2.7', '3.5', '3.6', '3.7', '3.8' or 'auto'. Each version has one
+analyzer with its grammar, keyword list and the Python 3 hint grammar; a 2.7
+module that imports print_function from __future__ gets the 2.7 grammar
+variant without the print statement. 'auto' picks, per file, the newest version under which no
 line has a syntax error; a file that fails under every version keeps the
 errors of the newest one.
 
@@ -35,6 +35,8 @@ kAutoOrder = ('3.8', '3.7', '3.6', '3.5', '2.7')
 kSourceSuffixes = ('.py', '.pyi')
 
 # The grammar of type hints is a Python 3 one whatever the version of the code.
+# 3.6's: a type holds no syntax that 3.7 or 3.8 added, and the hints of the
+# older versions stay as they were.
 kHintGrammar = 'Python-Grammar-3.6'
 kPrintFunctionGrammar = 'Python-Grammar-2.7-print-function'
 
