@@ -223,7 +223,9 @@ class VersionAnalyzer(object):
         """Analyzes one record (again, if it was already); returns None or a SyntaxError."""
         if logical.fInspected:
             logical.fInspected = False
-        error = impl.AnalyzeSingleLogical(logical, self._py3 and utils.InAsyncDef(logical))
+        # From 3.7 on async and await are keywords everywhere: no scope to look up.
+        in_async_def = self._py3 and self._triple < (3, 7) and utils.InAsyncDef(logical)
+        error = impl.AnalyzeSingleLogical(logical, in_async_def)
         if error is None:
             found = TokenError(self.version, logical)
             if found is not None:
