@@ -13,11 +13,17 @@ ast.walk that collects the names read and bound, which is what a Python user
 would write to get the same facts. Prints microseconds per logical line for
 each and the ratios.
 
+A third part analyzes the 3.8 standard library's logical lines with the 3.8
+analyzer and, on the same lines, with the 3.6 analyzer (the lines the 3.6
+grammar rejects included: both run every line), and prints microseconds per
+line for each and the ratio.
+
 A second pass renders every expression node of the same lines to text with
 the walker's converter (all three options true) and prints nanoseconds per
 node, side by side with the host's JoinTokens over each node's own tokens.
 
 Usage: TREELENS_BUILD_DIR=<build> python2.7 bench/treelens_bench.py [repeat] [file_limit] [render_repeat]
+       [py38_file_limit]
 """
 
 import ast
@@ -87,6 +93,25 @@ def TimeTreelens(analyzer, logicals, repeat):
         elapsed = time.time() - start
         best = elapsed if best is None else min(best, elapsed)
     return best
+
+
+def TimeVersion(version, logicals, repeat):
+    """Best seconds of the version's analyzer over the logicals, and how many it rejects."""
+    from pysource import analysis
+    analyzer = analysis.GetAnalyzer(version).Impl()
+    flags = [version < '3.7' and support.InAsyncDef(l) for l in logicals]
+    best, rejected = None, 0
+    for _ in range(repeat):
+        for logical in logicals:
+            logical.fInspected = False
+        gc.collect()
+        analyze = analyzer.AnalyzeSingleLogical
+        start = time.time()
+        results = [analyze(logical, in_async) for logical, in_async in zip(logicals, flags)]
+        elapsed = time.time() - start
+        best = elapsed if best is None else min(best, elapsed)
+        rejected = sum(1 for r in results if r is not None)
+    return best, rejected
 
 
 def TimeParseOnly(logicals, repeat):
@@ -239,6 +264,20 @@ def main():
     print('treelens TextForNode, all options: %9.1f ns/node' % (ours * 1e9 / nodes))
     print('symbolinfo.JoinTokens of the node tokens: %9.1f ns/node' % (peer * 1e9 / nodes))
     print('ratio TextForNode / JoinTokens: %.3f' % (ours / peer))
+    py38_limit = int(sys.argv[4]) if len(sys.argv) > 4 else limit
+    logicals = []
+    for path in support.CorpusFiles('3.8', limit=py38_limit):
+        logicals.extend(GetLogicalsFromText(support.ReadBytes(path)))
+    if not logicals:
+        print('no Python 3.8 standard library: 3.8 analyzer not timed')
+        return
+    n = len(logicals)
+    new, new_rejected = TimeVersion('3.8', logicals, repeat)
+    old, old_rejected = TimeVersion('3.6', logicals, repeat)
+    print('3.8 standard library logical lines: %d (best of %d runs)' % (n, repeat))
+    print('treelens 3.8 analyzer: %7.3f us/line (%d lines rejected)' % (new * 1e6 / n, new_rejected))
+    print('treelens 3.6 analyzer, same lines: %7.3f us/line (%d lines rejected)' % (old * 1e6 / n, old_rejected))
+    print('ratio 3.8 / 3.6 analyzer: %.3f' % (new / old))
 
 
 if __name__ == '__main__':

@@ -9,10 +9,10 @@
     for result in analysis.AnalyzeFolder('src'):              # 'auto' by default
         print(result.path, result.version, result.status, len(result.SyntaxErrors()))
 
-A version is '2.7', '3.5', '3.6' or 'auto'. Each version has one analyzer
-with its grammar, keyword list and the Python 3 hint grammar; a 2.7 module that
-imports print_function from __future__ gets the 2.7 grammar variant without
-the print statement. 'auto' picks, per file, the newest version under which no
+A version is '2.7', '3.5', '3.6', '3.7', '3.8' or 'auto'. Each version has one
+analyzer with its grammar, keyword list and the Python 3 hint grammar; a 2.7
+module that imports print_function from __future__ gets the 2.7 grammar
+variant without the print statement. 'auto' picks, per file, the newest version under which no
 line has a syntax error; a file that fails under every version keeps the
 errors of the newest one.
 
@@ -28,13 +28,15 @@ from pysource import _fastaccess
 from pysource import symbolinfo
 from pysource import utils
 
-kVersions = ('2.7', '3.5', '3.6')
+kVersions = ('2.7', '3.5', '3.6', '3.7', '3.8')
 kAuto = 'auto'
 # The order in which 'auto' tries the versions.
-kAutoOrder = ('3.6', '3.5', '2.7')
+kAutoOrder = ('3.8', '3.7', '3.6', '3.5', '2.7')
 kSourceSuffixes = ('.py', '.pyi')
 
 # The grammar of type hints is a Python 3 one whatever the version of the code.
+# 3.6's: a type holds no syntax that 3.7 or 3.8 added, and the hints of the
+# older versions stay as they were.
 kHintGrammar = 'Python-Grammar-3.6'
 kPrintFunctionGrammar = 'Python-Grammar-2.7-print-function'
 
@@ -44,13 +46,21 @@ kPy3Keywords = (
     'def', 'del', 'elif', 'else', 'except', 'finally', 'for', 'from', 'global',
     'if', 'import', 'in', 'is', 'lambda', 'nonlocal', 'not', 'or', 'pass',
     'raise', 'return', 'try', 'while', 'with', 'yield')
+# From 3.7 on async and await are keywords everywhere.
+kPy37Keywords = tuple(sorted(kPy3Keywords + ('async', 'await')))
 
 # Version -> (version triple, grammar file, Python 3 grammar).
 kGrammars = {
     '2.7': ((2, 7, 0), 'Python-Grammar-2.7', False),
     '3.5': ((3, 5, 0), 'Python-Grammar-3.5', True),
     '3.6': ((3, 6, 0), 'Python-Grammar-3.6', True),
+    '3.7': ((3, 7, 0), 'Python-Grammar-3.7', True),
+    '3.8': ((3, 8, 0), 'Python-Grammar-3.8', True),
 }
+
+# Version -> keyword list of a Python 3 version.
+kKeywords = {'3.5': kPy3Keywords, '3.6': kPy3Keywords,
+             '3.7': kPy37Keywords, '3.8': kPy37Keywords}
 
 kKindNames = {0: 'stmt', 1: 'class', 2: 'def', 11: 'try', 21: 'comment', 22: 'blank'}
 
@@ -152,6 +162,8 @@ _kTokenChecks = {
     '2.7': (re.compile(br'[0-9]_|[fF][rR]?[\'"]|[rR][fFbB][\'"]'), _Py2TokenError),
     '3.5': (re.compile(_kPy3Hint + br'|[0-9]_|[fF][rRbB]?[\'"]'), _Py3TokenError),
     '3.6': (re.compile(_kPy3Hint), _Py3TokenError),
+    '3.7': (re.compile(_kPy3Hint), _Py3TokenError),
+    '3.8': (re.compile(_kPy3Hint), _Py3TokenError),
 }
 
 
@@ -274,7 +286,7 @@ class VersionAnalyzer(object):
         if impl is None:
             from pysource import treelens
             if self._py3:
-                grammar, keywords = self._grammar, list(kPy3Keywords)
+                grammar, keywords = self._grammar, list(kKeywords[self.version])
             elif key:
                 import keyword
                 grammar = kPrintFunctionGrammar
@@ -294,7 +306,9 @@ class VersionAnalyzer(object):
         """Analyzes one record (again, if it was already); returns None or a SyntaxError."""
         if logical.fInspected:
             logical.fInspected = False
-        error = impl.AnalyzeSingleLogical(logical, self._py3 and utils.InAsyncDef(logical))
+        # From 3.7 on async and await are keywords everywhere: no scope to look up.
+        in_async_def = self._py3 and self._triple < (3, 7) and utils.InAsyncDef(logical)
+        error = impl.AnalyzeSingleLogical(logical, in_async_def)
         if error is None or self.checks:
             found = TokenError(self.version, logical)
             if found is not None and (error is None or _LexedFirst(logical, found, error)):
@@ -357,7 +371,7 @@ _gAnalyzers = {}
 
 
 def GetAnalyzer(version, checks=True):
-    """The VersionAnalyzer of a version ('2.7', '3.5' or '3.6'), made once per process.
+    """The VersionAnalyzer of a version (one of kVersions), made once per process.
 
     With checks (the default) lines the grammar accepts are also checked as
     CPython checks them after parsing (assignment targets, call arguments,

@@ -79,7 +79,7 @@ size_t matchOperator(const char *Text, size_t Len, TokenKind *Kind) {
   case ']': return Set(TokenKind::RSQB, 1);
   case '{': return Set(TokenKind::LBRACE, 1);
   case '}': return Set(TokenKind::RBRACE, 1);
-  case ':': return Set(TokenKind::COLON, 1);
+  case ':': return C1 == '=' ? Set(TokenKind::COLONEQUAL, 2) : Set(TokenKind::COLON, 1);
   case ',': return Set(TokenKind::COMMA, 1);
   case ';': return Set(TokenKind::SEMI, 1);
   case '~': return Set(TokenKind::TILDE, 1);

@@ -62,6 +62,7 @@ enum class TokenKind : uint8_t {
   ATEQUAL = 51,
   RARROW = 51,
   ELLIPSIS = 52,
+  COLONEQUAL = 55, ///< `:=`; 53 and 54 are the grammar's AWAIT and ASYNC
   ERRORTOKEN = 201,
   COMMENT = 202,
   CONTINUATION = 203,

@@ -25,7 +25,8 @@ _reported = []
 reflect.ReportCurrentException = lambda *a, **k: _reported.append(1)
 logging.disable(logging.CRITICAL)
 _analyzers = [tl.CPGenAnalyzerImpl((2, 7, 0), tl.kPy2DefaultGrammar, None, False),
-              tl.CPGenAnalyzerImpl((3, 6, 0)), tl.CPGenAnalyzerImpl((3, 7, 0))]
+              tl.CPGenAnalyzerImpl((3, 6, 0)), tl.CPGenAnalyzerImpl((3, 7, 0), 'Python-Grammar-3.7'),
+              tl.CPGenAnalyzerImpl((3, 8, 0), 'Python-Grammar-3.8')]
 
 def _Check(result):
     assert result is None or isinstance(result, SyntaxError), repr(result)

@@ -1,13 +1,16 @@
 """What CPython's own ast says a completed logical line binds, reads and declares.
 
 Runs unchanged under Python 2.7 and 3.x: the 2.7 corpus test imports it, the
-3.6 corpus test runs it in the 3.6 interpreter (Main reads a JSON list of
+3.x corpus tests run it in the 3.x interpreter (Main reads a JSON list of
 [key, source] pairs on stdin and prints {key: facts}).
 
 The facts follow what the symbol walker is meant to record, not everything
 CPython knows: the bodies of def and class are other logical lines, class
 bases and keywords are not read, the target of an augmented assignment is
-neither read nor bound, and names inside f-strings are another component's.
+neither read nor bound, and names inside f-strings are another component's
+(Main(fstring_reads=True) counts the names f-strings read all the same). An
+assignment expression binds its name on the line, also inside a
+comprehension, where CPython binds it in the enclosing scope.
 """
 
 import ast
@@ -54,7 +57,7 @@ def ParamNames(args):
             names.append(a.id)
         elif a is not None:
             names.append(getattr(a, 'arg', a))
-    for a in args.args:
+    for a in list(getattr(args, 'posonlyargs', [])) + list(args.args):
         Add(a)
     Add(args.vararg)
     for a in getattr(args, 'kwonlyargs', []):
@@ -65,7 +68,8 @@ def ParamNames(args):
 
 class Collector(ast.NodeVisitor):
 
-    def __init__(self):
+    def __init__(self, fstring_reads=False):
+        self.fstring_reads = fstring_reads
         self.bound, self.loads, self.within = [], set(), []
         self.globals, self.nonlocals = [], []
         self.args = self.bases = None
@@ -80,7 +84,8 @@ class Collector(ast.NodeVisitor):
             if sub is not None:
                 self.visit(sub)
         args = node.args
-        for a in list(args.args) + list(getattr(args, 'kwonlyargs', [])) + [args.vararg, args.kwarg]:
+        for a in (list(getattr(args, 'posonlyargs', [])) + list(args.args) + list(getattr(args, 'kwonlyargs', []))
+                  + [args.vararg, args.kwarg]):
             if getattr(a, 'annotation', None) is not None:
                 self.visit(a.annotation)
         if getattr(node, 'returns', None) is not None:
@@ -116,6 +121,10 @@ class Collector(ast.NodeVisitor):
         if node.value is not None:
             TargetNames(node.target, self.bound)
         self.generic_visit(node)
+
+    def visit_NamedExpr(self, node):
+        TargetNames(node.target, self.bound)
+        self.visit(node.value)
 
     def visit_AugAssign(self, node):
         self.visit(node.value)
@@ -160,26 +169,27 @@ class Collector(ast.NodeVisitor):
         self.nonlocals.extend(node.names)
 
     def visit_JoinedStr(self, node):
-        pass
+        if self.fstring_reads:
+            self.generic_visit(node)
 
 
-def Facts(source):
+def Facts(source, fstring_reads=False):
     """The facts of one completed logical line, or None when CPython cannot parse it."""
     try:
         tree = ast.parse(source)
     except (SyntaxError, ValueError, TypeError):
         return None
-    c = Collector()
+    c = Collector(fstring_reads)
     c.visit(tree)
     return {'bound': c.bound, 'loads': sorted(c.loads), 'within': c.within, 'globals': c.globals,
             'nonlocals': c.nonlocals, 'args': c.args, 'bases': c.bases}
 
 
-def Main():
+def Main(fstring_reads=False):
     items = json.loads(sys.stdin.read())
     out = {}
     for key, src in items:
-        out[key] = Facts(src.encode('latin-1'))
+        out[key] = Facts(src.encode('latin-1'), fstring_reads)
     sys.stdout.write(json.dumps(out))
 
 

@@ -113,7 +113,7 @@ def RunOracle(version, script, stdin_data=None):
 
 
 def Analyzer(version):
-    """The shared CPGenAnalyzerImpl of a language version ('2.7', '3.5', '3.6'), as the API makes it."""
+    """The shared CPGenAnalyzerImpl of a language version ('2.7' to '3.8'), as the API makes it."""
     from pysource import analysis
     return analysis.GetAnalyzer(version, checks=False).Impl()
 

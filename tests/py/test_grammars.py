@@ -28,13 +28,13 @@ from pysource import _pgengen
 from tests.py import support
 
 kGrammarDir = os.path.join(support.kRoot, 'resources', 'pgen-grammars')
-kVersions = ('2.7', '3.5', '3.6')
+kVersions = ('2.7', '3.5', '3.6', '3.7', '3.8')
 
 # Token numbering the analyzer passes to the parser generator.
 kTokNumber2Name = dict(token.tok_name)
-kTokNumber2Name.update({51: 'RARROW', 53: 'AWAIT', 54: 'ASYNC'})
+kTokNumber2Name.update({51: 'RARROW', 53: 'AWAIT', 54: 'ASYNC', 55: 'COLONEQUAL'})
 kOpText2Number = dict(pgen_grammar.opmap)
-kOpText2Number.update({'...': 52, '->': 51})
+kOpText2Number.update({'...': 52, '->': 51, ':=': 55})
 NAME, NUMBER, STRING, NEWLINE, ENDMARKER = 1, 2, 3, 4, 0
 COLON, AT, AWAIT, ASYNC = 11, 50, 53, 54
 kErrorToken = 201
@@ -607,6 +607,13 @@ kRulesByVersion = {
     '3.5': kRules35,
     '3.6': kRules35 + ["annassign: ':' test ['=' test]"],
 }
+kRulesByVersion['3.7'] = kRulesByVersion['3.6']
+kRulesByVersion['3.8'] = [r for r in kRules35 if not r.startswith('yield_arg')] + [
+    "yield_arg: 'from' test | testlist_star_expr",
+    "annassign: ':' test ['=' (yield_expr|testlist_star_expr)]",
+    "namedexpr_test: test [':=' test]",
+    "testlist_comp: (namedexpr_test|star_expr) ( comp_for | (',' (namedexpr_test|star_expr))* [','] )",
+]
 
 kCommonStates = ['with_stmt', 'with_item', 'pass_stmt', 'expr_stmt',
                  'return_stmt', 'power', 'trailer', 'atom', 'funcdef',
@@ -623,16 +630,21 @@ kStatesByVersion = {
                             'atom_expr', 'star_expr', 'yield_arg'],
 }
 kStatesByVersion['3.6'] = kStatesByVersion['3.5'] + ['annassign']
+kStatesByVersion['3.7'] = kStatesByVersion['3.6']
+kStatesByVersion['3.8'] = kStatesByVersion['3.6'] + ['namedexpr_test']
 kAbsentByVersion = {
     '2.7': ['atom_expr', 'nonlocal_stmt', 'star_expr', 'annassign',
-            'async_stmt', 'typedargslist'],
-    '3.5': ['print_stmt', 'exec_stmt', 'list_for', 'fplist', 'annassign'],
-    '3.6': ['print_stmt', 'exec_stmt', 'list_for', 'fplist'],
+            'async_stmt', 'typedargslist', 'namedexpr_test'],
+    '3.5': ['print_stmt', 'exec_stmt', 'list_for', 'fplist', 'annassign', 'namedexpr_test'],
+    '3.6': ['print_stmt', 'exec_stmt', 'list_for', 'fplist', 'namedexpr_test'],
+    '3.7': ['print_stmt', 'exec_stmt', 'list_for', 'fplist', 'namedexpr_test'],
+    '3.8': ['print_stmt', 'exec_stmt', 'list_for', 'fplist'],
 }
 
 # Single logical lines (source text) and the versions whose grammar accepts them.
-kAll = ('2.7', '3.5', '3.6')
-kPy3 = ('3.5', '3.6')
+kAll = ('2.7', '3.5', '3.6', '3.7', '3.8')
+kPy3 = ('3.5', '3.6', '3.7', '3.8')
+kPy36 = ('3.6', '3.7', '3.8')
 kSnippets = [
     ('x = 1', kAll),
     ('a, b = b, a', kAll),
@@ -654,8 +666,8 @@ kSnippets = [
     ('def f(a, (b, c)=(1, 2), *args, **kw): pass', ('2.7',)),
     ('def f(a: int, *, b: str = "") -> bool:', kPy3),
     ('def f(a, *, b): pass', kPy3),
-    ('def f(**kw,): pass', ('3.6',)),
-    ('def f(a, *, b,): pass', ('3.6',)),
+    ('def f(**kw,): pass', kPy36),
+    ('def f(a, *, b,): pass', kPy36),
     ('lambda a, *b, **c: 0', kAll),
     ('lambda *, k: k', kPy3),
     ('except ValueError, e:', ('2.7',)),
@@ -676,8 +688,8 @@ kSnippets = [
     ('from .. import x', kAll),
     ('from .a.b import (c as d, e,)', kAll),
     ('import a.b as c, d', kAll),
-    ('x: int = 1', ('3.6',)),
-    ('self.x: List[int]', ('3.6',)),
+    ('x: int = 1', kPy36),
+    ('self.x: List[int]', kPy36),
     ('x = [i for i in a if i]', kAll),
     ('x = [i for i in a, b]', ('2.7',)),
     ('x = [i for i in lambda: 1 if 0 else 2]', ()),
@@ -721,6 +733,35 @@ kSnippets = [
     ('f(**a, b)', kPy3),
     ('f(a for a in b, c)', kAll),
     ('x = a $ b', ()),
+    # 3.8: assignment expressions where CPython 3.8's grammar has them, positional-only
+    # parameters, starred values after return, yield and an annotated assignment's '='.
+    ('if (n := len(a)) > 10: pass', ('3.8',)),
+    ('if x := f(): pass', ('3.8',)),
+    ('elif x := f(): pass', ('3.8',)),
+    ('while chunk := read(): pass', ('3.8',)),
+    ('x = [y := f(x), y ** 2]', ('3.8',)),
+    ('x = [y for x in d if (y := f(x))]', ('3.8',)),
+    ('x = [y := 1 for x in d]', ('3.8',)),
+    ('f(x := 1, y=2)', ('3.8',)),
+    ('x := 1', ()),
+    ('x = y := 1', ()),
+    ('x = [y for x in d if y := f(x)]', ()),
+    ('x = {y := 1}', ()),
+    ('x = a[y := 1]', ()),
+    ('f(x := 1 for x in y)', ()),
+    ('f(a=b := 1)', ()),
+    ('def f(a, b=1, /, c=2, *, d): pass', ('3.8',)),
+    ('def f(a: int, /): pass', ('3.8',)),
+    ('def f(a, /,): pass', ('3.8',)),
+    ('lambda a, /, b: a', ('3.8',)),
+    ('def f(/, a): pass', ()),
+    ('def f(a, /, /): pass', ()),
+    ('def f(*a, /): pass', ()),
+    ('return *a, b', ('3.8',)),
+    ('x = yield *a, b', ('3.8',)),
+    ('x: T = 1, 2', ('3.8',)),
+    ('x: T = yield', ('3.8',)),
+    ('return *a', ('3.8',)),  # as in CPython 3.8's grammar; its compiler rejects the lone star
 ]
 # Snippets whose `async`/`await` are keyword tokens: (text, versions).
 kAsyncSnippets = [
@@ -728,7 +769,8 @@ kAsyncSnippets = [
     ('ASYNC for a in b:', kPy3),
     ('ASYNC with a as b:', kPy3),
     ('x = AWAIT f() ** 2', kPy3),
-    ('x = [i ASYNC for i in a]', ('3.6',)),
+    ('x = [i ASYNC for i in a]', kPy36),
+    ('x = [AWAIT i ASYNC for i in a if (j := i)]', ('3.8',)),
     ('x = AWAIT', ()),
     ('ASYNC x = 1', ()),
     ('ASYNC class A:', ()),

@@ -1,5 +1,5 @@
-"""The type-hint walker: what annotations and type comments record under the 2.7 and 3.6 analyzers,
-its operations, and three judges over real code: CPython's ast of the typeshed stubs, the same defs
+"""The type-hint walker: what annotations and type comments record under the 2.7, 3.6 and 3.8 analyzers,
+its operations, and three judges over real code: CPython's ast of the typeshed stubs (3.6 and 3.8), the same defs
 rewritten in the type-comment form, and the type comments CPython 3.8 itself attaches. Also mangled
 comments on real lines, and the hint parser's free lists and memory over repeated passes.
 """
@@ -63,7 +63,7 @@ class ReportsCollected(object):
 
 A0, A1 = si.BuildArgInfo(0, None), si.BuildArgInfo(1, None)
 
-# (source, plain hints, argument hints); checked under the 2.7 and the 3.6 analyzer.
+# (source, plain hints, argument hints); checked under the 2.7 and the Python 3 analyzers.
 kCases = [
     (b'x = []  # type: List[int]\n', [(b'x', b'List[int]')], []),
     (b'x = y = []  # type: List[int]\n', [(b'x', b'List[int]')], []),  # the first target only
@@ -116,11 +116,21 @@ kCases36 = [
     (b'async def f(a: int) -> Awaitable[None]: pass\n', [], [(b'a', b'int'), (b'return', b'Awaitable[None]')]),
 ]
 
+# 3.8: positional-only parameters, annotated and in the comment form; an annotated tuple value.
+kCases38 = [
+    (b'def f(a: int, /, b: str = x, *, c: T) -> None: pass\n', [],
+     [(b'a', b'int'), (b'b', b'str'), (b'c', b'T'), (b'return', b'None')]),
+    (b'def f(a, /, b):  # type: (int, str) -> None\n', [], [(b'a', b'int'), (b'b', b'str'), (b'return', b'None')]),
+    (b'x: Tuple[int, int] = 1, 2\n', [(b'x', b'Tuple[int, int]')], []),
+    (b'if (n := f()):  # type: ignore\n', [], []),
+]
+
 
 class RecordsTest(ReportsCollected, unittest.TestCase):
 
     def testCases(self):
-        for versions, cases in ((('2.7', '3.6'), kCases), (('3.6',), kCases36)):
+        for versions, cases in ((('2.7', '3.6', '3.7', '3.8'), kCases), (('3.6', '3.7', '3.8'), kCases36),
+                                (('3.8',), kCases38)):
             for version in versions:
                 for source, plain, args in cases:
                     logicals, failed = Analyze(version, source)
@@ -246,7 +256,7 @@ for key, src, plain, args in json.loads(sys.stdin.read()):
                 want_plain.append((name, ('tree', Tree(n.annotation))))
             continue
         a = n.args
-        for arg in a.args + [a.vararg] + a.kwonlyargs + [a.kwarg]:
+        for arg in getattr(a, 'posonlyargs', []) + a.args + [a.vararg] + a.kwonlyargs + [a.kwarg]:
             if arg is not None and arg.annotation is not None:
                 want_args.append((arg.arg, ('tree', Tree(arg.annotation))))
         if n.returns is not None:
@@ -276,13 +286,13 @@ sys.stdout.write(json.dumps(out))
 '''
 
 
-def StubLogicals(limit=None):
-    """(path, logicals) of the typeshed stubs, analyzed under 3.6; skips the test without them."""
+def StubLogicals(version='3.6', limit=None):
+    """(path, logicals) of the typeshed stubs, analyzed under version; skips the test without them."""
     files = support.StubFiles(limit)
     if not files:
         raise unittest.SkipTest('typeshed stubs not fetched (tools/fetch-stubs.sh needs npm)')
     for path in files:
-        yield path, Analyze('3.6', support.ReadBytes(path))[0]
+        yield path, Analyze(version, support.ReadBytes(path))[0]
 
 
 def Significant(logical):
@@ -292,32 +302,33 @@ def Significant(logical):
 _kParsers = {}
 
 
-def Parse(logical, in_async_def=False):
-    """The 3.6 tree of a logical (the caller discards it with Parser36().DiscardNode), or None."""
+def Parse(logical, in_async_def=False, version='3.6'):
+    """The tree of a logical under version (the caller discards it with Parser(version).DiscardNode), or None."""
     try:
-        return Parser36().ParseToNode(logical, in_async_def)
+        return Parser(version).ParseToNode(logical, in_async_def)
     except Exception:
         return None
 
 
-def Parser36():
-    if not _kParsers:
-        _kParsers['3.6'] = tl.CPGenParserImpl((3, 6, 0), 'Python-Grammar-3.6', list(analysis.kPy3Keywords), True)
-    return _kParsers['3.6']
+def Parser(version='3.6'):
+    if version not in _kParsers:
+        triple, grammar, _ = analysis.kGrammars[version]
+        _kParsers[version] = tl.CPGenParserImpl(triple, grammar, list(analysis.kKeywords[version]), True)
+    return _kParsers[version]
 
 
-def CommentForm(logical):
+def CommentForm(logical, version='3.6'):
     """(the def of an annotated def logical in the type-comment form, in a class?), or None.
 
     Every parameter but a method's first must be annotated and the return type given.
     """
-    tree = Parse(logical, support.InAsyncDef(logical))
+    tree = Parse(logical, support.InAsyncDef(logical), version)
     if tree is None:
         return None
     if isinstance(tree, tl.CFuncdefStmt):
         params = [a for a in tl.GetDefiningArgInfoList(tree.GetParameters()) if isinstance(a, tl.CArgInfo)]
         params = [(a.prefix or b'', a.name.fText) for a in params if a.name is not None]
-    Parser36().DiscardNode(tree)
+    Parser(version).DiscardNode(tree)
     if not isinstance(tree, tl.CFuncdefStmt):
         return None
     _, args = HintsOf([logical])
@@ -338,9 +349,15 @@ def CommentForm(logical):
 class StubCorpusTest(ReportsCollected, unittest.TestCase):
     """Over the typeshed stubs: annotations judged by CPython, then the same defs as type comments."""
 
-    def testAnnotationsAndCommentForm(self):
+    def testAnnotationsAndCommentForm36(self):
+        self.Check('3.6')
+
+    def testAnnotationsAndCommentForm38(self):
+        self.Check('3.8')
+
+    def Check(self, version):
         items, forms, lines = [], [], 0
-        for path, logicals in StubLogicals():
+        for path, logicals in StubLogicals(version):
             for i, logical in enumerate(logicals):
                 lines += 1
                 if logical.fKind not in (0, 1, 2) or b':' not in Significant(logical):
@@ -350,27 +367,28 @@ class StubCorpusTest(ReportsCollected, unittest.TestCase):
                 items.append([key, Latin(CompletedSource(logical)), [(Latin(n), Latin(t)) for n, t in plain],
                               [(Latin(n), Latin(t)) for n, t in args]])
                 if logical.fKind == 2 and args:
-                    form = CommentForm(logical)
+                    form = CommentForm(logical, version)
                     if form is not None:
                         forms.append((key, args, form))
-        judged = Oracle('3.6', kAnnotationJudge, items)
+        judged = Oracle(version, kAnnotationJudge, items)
         if judged is None:
-            self.skipTest('no Python 3.6')
+            self.skipTest('no Python %s' % version)
         wrong = ['%s: %s' % (k, d) for k, diffs in sorted(judged.items()) if diffs for d in diffs]
         compiled = sum(1 for v in judged.values() if v is not None)
         # The comment form records what the annotations record, under 2.7 (where type comments are the
-        # only way to give hints) as under 3.6.
+        # only way to give hints) as under the version.
         for key, args, (source, in_class) in forms:
             prefix = b'class C:\n    ' if in_class else b''
-            for version in ('2.7', '3.6'):
-                logicals, failed = Analyze(version, prefix + source)
-                if failed and version == '2.7':  # not 2.7 code: async def, keyword-only parameters, print
+            for form_version in ('2.7', version):
+                logicals, failed = Analyze(form_version, prefix + source)
+                if failed and form_version == '2.7':  # not 2.7 code: async def, keyword-only parameters, print
                     continue
                 got = HintsOf(logicals[-1:])[1]
                 if failed or got != args:
-                    wrong.append('%s under %s: %r records %r, annotated %r' % (key, version, source, got, args))
-        sys.stderr.write('\nstubs: %d logical lines, %d judged by CPython 3.6, %d defs in the comment form, '
-                         '%d disagree\n' % (lines, compiled, len(forms), len(wrong)))
+                    wrong.append('%s under %s: %r records %r, annotated %r'
+                                 % (key, form_version, source, got, args))
+        sys.stderr.write('\nstubs: %d logical lines, %d judged by CPython %s, %d defs in the comment form, '
+                         '%d disagree\n' % (lines, compiled, version, len(forms), len(wrong)))
         self.assertGreater(compiled, 0)
         self.assertEqual(wrong[:30], [], '\n'.join(wrong[:30]))
 
@@ -412,7 +430,7 @@ def CommentedStatements(rnd, limit):
             else:
                 targets = []
             hints = [Shape(walker, t, rnd) for t in targets]
-            Parser36().DiscardNode(tree)
+            Parser().DiscardNode(tree)
             if hints and None not in hints and (isinstance(tree, tl.CExprStmt) or len(set(hints)) == 1):
                 form = rnd.choice([b'  # type: %s', b'  #type:%s', b'  # the type: %s', b'  # type: ignore'])
                 text = logical.fLineText.rstrip(b'\r\n')
@@ -432,7 +450,7 @@ class TypeCommentOracleTest(ReportsCollected, unittest.TestCase):
             self.skipTest('no Python 3.8')
         rnd = random.Random(86)
         sources = CommentedStatements(rnd, 40 if support.kSanitized else 250)
-        for path, logicals in StubLogicals(40 if support.kSanitized else 400):
+        for path, logicals in StubLogicals(limit=40 if support.kSanitized else 400):
             for logical in logicals:
                 form = logical.fKind == 2 and CommentForm(logical)
                 if form:

@@ -42,7 +42,7 @@ class GetTokenTypeTest(unittest.TestCase):
         cases = [
             (b'', 0), (b'\n', 4), (b'print', 1), (b'\xc3\xa9', 1), (b'0777L', 2), (b'.5', 2),
             (b"fR''", 3), (b"'unterminated", 3), (b'...', 52), (b'$', 201), (b'!', 201),
-            (b'# c', 202), (b'\\', 203), (b'..', 23), (b"bu''", 1),
+            (b'# c', 202), (b'\\', 203), (b'..', 23), (b"bu''", 1), (b':=', 55), (b':', 11),
         ]
         for text, want in cases:
             self.assertEqual(fa.GetTokenType(text), want, 'GetTokenType(%r)' % text)
@@ -67,6 +67,7 @@ class TokenizeTest(unittest.TestCase):
         cases = [
             (b'a<>b', [b'a', b'<>', b'b']),
             (b'x[...]', [b'x', b'[', b'...', b']']),
+            (b'(y:=1)', [b'(', b'y', b':=', b'1', b')']),
             (b'x = 1 \\\n  + f"{y}"  # c\n', [b'x', b'=', b'1', b'\\', b'+', b'f"{y}"', b'# c']),
             (b"s = '''a\nb'''", [b's', b'=', b"'''a\nb'''"]),
             (b'\xef\xbb\xbfimport os\r\n', [b'import', b'os']),

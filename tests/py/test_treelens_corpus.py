@@ -1,12 +1,14 @@
-"""pysource.treelens over the 2.7 and 3.6 standard libraries, checked against CPython's own compiler.
+"""pysource.treelens over the 2.7, 3.6, 3.7 and 3.8 standard libraries and the typeshed stubs,
+checked against CPython's own compiler.
 
 Every logical line of a file that CPython compiles must analyze to None with
 the grammar of the same version; a line that yields a SyntaxError must be one
 that CPython also rejects (its source, completed as the analyzer completes its
 tokens, does not compile). What each analyzed line records is checked against
-CPython's ast of the same completed line (tests/py/astfacts.py; the 3.6 side
-runs in the 3.6 interpreter). Also: analyzing the 2.7 standard library five
-times leaves memory flat after the first pass.
+CPython's ast of the same completed line (tests/py/astfacts.py; the 3.x side
+runs in the 3.x interpreter, and under 3.8 it also counts the names f-strings
+read). Also: analyzing the 2.7 standard library five times leaves memory flat
+after the first pass.
 """
 
 import gc
@@ -128,15 +130,19 @@ class AstJudge(object):
                 self.wrong.extend('%s:%d: %r: %s' % (path, line, text, d) for d in Disagreements(rec, fact))
 
 
-def Facts36(sources):
-    """The ast facts of sources as the 3.6 interpreter gives them."""
-    data = json.dumps([[str(i), src.decode('latin-1')] for i, src in enumerate(sources)])
-    out = json.loads(support.RunOracle('3.6', kFactsMain, data))
-    return [out[str(i)] for i in range(len(sources))]
+def FactsOf(version):
+    """The function giving the ast facts of sources as the X.Y interpreter gives them."""
+    script = kFactsMain % (version >= '3.8')
+
+    def Facts(sources):
+        data = json.dumps([[str(i), src.decode('latin-1')] for i, src in enumerate(sources)])
+        out = json.loads(support.RunOracle(version, script, data))
+        return [out[str(i)] for i in range(len(sources))]
+    return Facts
 
 
-kFactsMain = 'import sys; sys.path.insert(0, %r); import astfacts; astfacts.Main()' % os.path.dirname(
-    os.path.abspath(__file__))
+kFactsMain = ('import sys; sys.path.insert(0, %r); import astfacts; astfacts.Main(%%s)'
+              % os.path.dirname(os.path.abspath(__file__)))
 
 
 def Describe(path, logical, result):
@@ -202,33 +208,48 @@ class Corpus27Test(unittest.TestCase):
         self.assertEqual(judged[:40], [], '\n'.join(judged[:40]))
 
 
-class Corpus36Test(unittest.TestCase):
+class Corpus3Test(unittest.TestCase):
+    """Each Python 3 version's analyzer over that version's standard library, judged by its CPython."""
 
-    def testStdlib(self):
-        files = support.CorpusFiles('3.6')
-        if not files or support.Interpreter('3.6') is None:
-            self.skipTest('no Python 3.6 standard library')
-        analyzer = analysis.GetAnalyzer('3.6').ImplFor([])
+    def Check(self, version, files, what='standard library'):
+        if not files or support.Interpreter(version) is None:
+            self.skipTest('no Python %s %s' % (version, what))
+        analyzer = analysis.GetAnalyzer(version).ImplFor([])
+        # 3.7 on, async and await are keywords everywhere: no scope rule to apply.
+        async_scopes = version < '3.7'
         texts = [(path, support.ReadBytes(path)) for path in files]
-        compiling = OracleCompiles('3.6', texts)
+        compiling = OracleCompiles(version, texts)
         wrong, judged, suspects, counts = [], [], [], []
-        judge = AstJudge(Facts36, judged, batch=40000)  # one 3.6 process per 40,000 lines
+        judge = AstJudge(FactsOf(version), judged, batch=40000)  # one process per 40,000 lines
         for path, text in texts:
             analyzed = []
-            for logical, result in Analyze(analyzer, text, True, counts, analyzed):
+            for logical, result in Analyze(analyzer, text, async_scopes, counts, analyzed):
                 if path in compiling:
                     wrong.append(Describe(path, logical, result))
                 else:
                     suspects.append((len(suspects), (path, logical, result)))
             judge.Add(path, analyzed)
         judge.Flush()
-        accepted = OracleCompiles('3.6', [(i, CompletedSource(l)) for i, (_, l, _) in suspects])
+        accepted = OracleCompiles(version, [(i, CompletedSource(l)) for i, (_, l, _) in suspects])
         wrong.extend(Describe(*item) for i, item in suspects if i in accepted)
-        sys.stderr.write('\n3.6 corpus: %d files (%d rejected by CPython), %d logical lines, %d disagree, '
+        sys.stderr.write('\n%s %s: %d files (%d rejected by CPython), %d logical lines, %d disagree, '
                          '%d disagree with the ast\n'
-                         % (len(texts), len(texts) - len(compiling), sum(counts), len(wrong), len(judged)))
+                         % (version, what, len(texts), len(texts) - len(compiling), sum(counts), len(wrong),
+                            len(judged)))
         self.assertEqual(wrong[:40], [])
         self.assertEqual(judged[:40], [], '\n'.join(judged[:40]))
+
+    def testStdlib36(self):
+        self.Check('3.6', support.CorpusFiles('3.6'))
+
+    def testStdlib37(self):
+        self.Check('3.7', support.CorpusFiles('3.7'))
+
+    def testStdlib38(self):
+        self.Check('3.8', support.CorpusFiles('3.8'))
+
+    def testStubs38(self):
+        self.Check('3.8', support.StubFiles(), 'typeshed stubs')
 
 
 def ResidentBytes():

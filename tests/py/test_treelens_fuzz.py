@@ -24,7 +24,8 @@ kRounds = int(os.environ.get('TREELENS_FUZZ_ROUNDS') or (600 if support.kSanitiz
 kSeed = int(os.environ.get('TREELENS_FUZZ_SEED') or 20261206)
 kSpecial = [b'\\', b'$', b'?', b'...', b'async', b'await', b'@', b'->', b'else', b'except',
             b'finally', b'elif', b'try', b'def', b'class', b'lambda', b':', b'(', b')', b'[',
-            b'{', b'}', b',', b'*', b'**', b'=', b'f"{x}"', b'# type: int', b'\n']
+            b'{', b'}', b',', b'*', b'**', b'=', b'f"{x}"', b'# type: int', b'\n', b':=', b'/',
+            b'f"{x=!r:>{w}}"']
 
 
 def RandomFString(rnd, depth=0):
@@ -73,11 +74,14 @@ class FuzzTest(unittest.TestCase):
         analyzers = [tl.CPGenAnalyzerImpl((2, 7, 0), tl.kPy2DefaultGrammar, None, False),
                      tl.CPGenAnalyzerImpl((3, 5, 0), 'Python-Grammar-3.5'),
                      tl.CPGenAnalyzerImpl((3, 6, 0)),
-                     tl.CPGenAnalyzerImpl((3, 7, 0)),
+                     tl.CPGenAnalyzerImpl((3, 7, 0), 'Python-Grammar-3.7'),
+                     tl.CPGenAnalyzerImpl((3, 8, 0), 'Python-Grammar-3.8'),
                      tl.CPGenAnalyzerImpl((2, 7, 0), tl.kPy2DefaultGrammar, None, False, syntax_checks=True),
-                     tl.CPGenAnalyzerImpl((3, 6, 0), syntax_checks=True)]
+                     tl.CPGenAnalyzerImpl((3, 6, 0), syntax_checks=True),
+                     tl.CPGenAnalyzerImpl((3, 8, 0), 'Python-Grammar-3.8', syntax_checks=True)]
         lines, vocab = [], set(kSpecial)
-        for path in support.CorpusFiles('2.7', limit=25) + support.CorpusFiles('3.6', limit=25):
+        for path in (support.CorpusFiles('2.7', limit=25) + support.CorpusFiles('3.6', limit=25)
+                     + support.CorpusFiles('3.8', limit=25)):
             for logical in utils.GetLogicalsFromText(support.ReadBytes(path)):
                 if logical.fKind != 22:
                     lines.append(logical.fLineText)

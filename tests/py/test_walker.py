@@ -167,6 +167,32 @@ class RecordsTest(unittest.TestCase):
         self.check('2.7', b'exec code in ns\n', [], {b'code', b'ns'})
         self.check('2.7', b'[x for x in y]\n', equivs=[(b'x', si.kWithinExprPrefix + b'3')])
 
+    def testPython38(self):
+        w, tup, called = si.kWithinExprPrefix, tl.kTupleInstanceName, si.kCalledPrefix
+        # An assignment expression binds like an assignment, also in a comprehension, and reads its value.
+        self.check('3.8', b'if (n := len(a)) > 10: pass\n', [b'n'], {b'a', b'len'},
+                   [(b'n', b'len(a)'), (b'len', called + b'(a)')])
+        self.check('3.8', b'while chunk := f.read(): pass\n', [b'chunk'], {b'f', b'f.read'})
+        self.check('3.8', b'[y for x in d if (y := g(x))]\n', [b'y'], {b'x', b'y', b'd', b'g'},
+                   [(b'y', b'g(x)'), (b'g', called + b'(x)'), (b'x', w + b'3')])
+        self.check('3.8', b'print(z := 1, sep=s)\n', [b'z'], {b'print', b's'}, [(b'z', Lit(b'int', b'1'))])
+        self.check('3.8', b'a = (b := 2)\n', [b'a', b'b'], set(), [(b'a', Lit(b'int', b'2')), (b'b', Lit(b'int', b'2'))])
+        self.check('3.8', b'x = [y := 1, y]\n', [b'x', b'y'], {b'y'})
+        # Positional-only parameters are arguments in order; the '/' is none.
+        self.check('3.8', b'def f(a, b=1, /, c=2, *, d): pass\n', args=[b'a', b'b', b'c', b'd'],
+                   arg_equivs=[(b'b', Lit(b'int', b'1')), (b'c', Lit(b'int', b'2'))])
+        self.check('3.8', b'def f(a, /): pass\n', args=[b'a'])
+        self.check('3.8', b'g = lambda a, /, b: a\n', [b'g'], {b'a'}, [(b'a', w + b'3'), (b'b', w + b'7')])
+        # Unparenthesized starred values after return and yield, and an annotated assignment's tuple.
+        self.check('3.8', b'return *a, b\n', reads={b'a', b'b'})
+        self.check('3.8', b'yield *a, b\n', reads={b'a', b'b'}, equivs=[(b'yield', tup)])
+        self.check('3.8', b'x: T = 1, 2\n', [b'x'], {b'T'}, [(b'x', tup)])
+        # The self-documenting f-string field reads its expression.
+        self.check('3.8', b"s = f'{x=} {y = !r:>{w}}'\n", [b's'], {b'x', b'y', b'w'})
+        for version in ('3.6', '3.7'):
+            for source in (b'(n := 1)\n', b'def f(a, /): pass\n', b"s = f'{x=}'\n"):
+                self.assertIsInstance(Record(version, source)[0], SyntaxError, (version, source))
+
     def testAsync(self):
         self.check('3.6', b'x = await y\n', [b'x'], {b'y'}, in_async_def=True)
         self.check('3.6', b'async for a in b: pass\n', [b'a'], {b'b'}, in_async_def=True)

@@ -211,6 +211,41 @@ Py_ssize_t statementToken(LogicalLineObject *Sub) {
   return -1;
 }
 
+/// Whether the analyzer's version has the self-documenting `f'{x=}'` (3.8 on).
+bool hasSelfDocumentingFields(AnalyzerObject *A) {
+  PyObject *Triple = A->LogicalParser ? A->LogicalParser->VersionTriple : nullptr;
+  if (!Triple)
+    return false;
+  static PyObject *Py38 = Py_BuildValue("(ii)", 3, 8);
+  if (!Py38)
+    throw tl::PyErrSet();
+  return tl::requireStatus(PyObject_RichCompareBool(Triple, Py38, Py_GE)) != 0;
+}
+
+/// Sub without its last token when that is a lone '=': the marker of a
+/// self-documenting replacement field (`f'{x=}'`, `f'{x = !r}'`); '==',
+/// '!=', '<=' and '>=' are tokens of their own and no marker. Null otherwise.
+Ref withoutSelfDocumentingMarker(LogicalLineObject *Sub) {
+  Py_ssize_t Last = Sub->TokenCount - 1;
+  while (Last >= 0 && Sub->Texts[Last] && PyString_Check(Sub->Texts[Last]) &&
+         PyString_GET_SIZE(Sub->Texts[Last]) > 0 && PyString_AS_STRING(Sub->Texts[Last])[0] == '#')
+    --Last;
+  if (Last < 1 || !Sub->Texts[Last] || !PyString_Check(Sub->Texts[Last]) || !textIs(Sub->Texts[Last], "="))
+    return Ref();
+  Ref Tokens = tl::require(PyTuple_New(Last));
+  for (Py_ssize_t I = 0; I < Last; ++I) {
+    PyObject *Entry = Py_BuildValue("(O(ll))", Sub->Texts[I] ? Sub->Texts[I] : Py_None,
+                                    static_cast<long>(Sub->Positions[I].Row), static_cast<long>(Sub->Positions[I].Col));
+    if (!Entry)
+      throw tl::PyErrSet();
+    PyTuple_SET_ITEM(Tokens.get(), I, Entry);
+  }
+  PyObject *LineText = Sub->LineText ? Sub->LineText : Py_None;
+  return tl::require(PyObject_CallFunction(reinterpret_cast<PyObject *>(Host.LogicalLineType),
+                                           const_cast<char *>("(OilO)"), Tokens.get(), 0,
+                                           static_cast<long>(Sub->FirstLine), LineText));
+}
+
 /// _InspectSingleFStringToken: analyzes each expression of the token Text (at
 /// index TokenI of Logical) with f-string inspection suppressed and copies
 /// its findings into Logical.
@@ -219,6 +254,12 @@ void inspectSingleFStringToken(AnalyzerObject *A, PyObject *Logical, Py_ssize_t 
   std::vector<ExprItem> Items = expressionPartList(supportOf(A), Text, /*WantText=*/false);
   for (ExprItem &It : Items) {
     PyObject *Sub = It.Logical ? It.Logical.get() : Py_None;
+    if (host::isLogical(Sub) && hasSelfDocumentingFields(A)) {
+      if (Ref Stripped = withoutSelfDocumentingMarker(record(Sub))) {
+        It.Logical = std::move(Stripped);
+        Sub = It.Logical.get();
+      }
+    }
     if (host::isLogical(Sub)) {
       Py_ssize_t At = statementToken(record(Sub));
       if (At >= 0)

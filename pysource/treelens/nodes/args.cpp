@@ -205,6 +205,8 @@ Ref definingListOfArglist(NodeObject *List) {
       ExpectDefault = ExpectAnnotation = false;
     } else if (leafIs(Child, "*") || leafIs(Child, "**")) {
       setPrefix(argInfo(Arg), Child->Text);
+    } else if (leafIs(Child, "/")) {
+      // The marker after the positional-only parameters names none.
     } else if (leafIs(Child, "=")) {
       ExpectDefault = true;
     } else if (leafIs(Child, ":")) {

@@ -32,16 +32,20 @@ const char *const DottedNameRules[] = {"dotted_name: NAME ('.' NAME)*", nullptr}
 const char *const MultipleDecoratorsRules[] = {"decorators: decorator+", nullptr};
 const char *const ExceptClauseRules[] = {"except_clause: 'except' [test [('as' | ',') test]]",
                                          "except_clause: 'except' [test ['as' NAME]]", nullptr};
-const char *const AnnotatedAssignRules[] = {"annassign: ':' test ['=' test]", nullptr};
+const char *const AnnotatedAssignRules[] = {"annassign: ':' test ['=' test]",
+                                             "annassign: ':' test ['=' (yield_expr|testlist_star_expr)]", nullptr};
 const char *const YieldExprRules[] = {"yield_expr: 'yield' [testlist]", "yield_expr: 'yield' [yield_arg]",
                                       nullptr};
-const char *const YieldArgRules[] = {"yield_arg: 'from' test | testlist", nullptr};
+const char *const YieldArgRules[] = {"yield_arg: 'from' test | testlist", "yield_arg: 'from' test | testlist_star_expr",
+                                      nullptr};
 const char *const TestListStarExprRules[] = {
     "exprlist: expr (',' expr)* [',']", "testlist: test (',' test)* [',']",
     "testlist_star_expr: (test|star_expr) (',' (test|star_expr))* [',']",
-    "testlist_comp: test ( comp_for | (',' test)* [','] )", nullptr};
+    "testlist_comp: test ( comp_for | (',' test)* [','] )",
+    "testlist_comp: (namedexpr_test|star_expr) ( comp_for | (',' (namedexpr_test|star_expr))* [','] )", nullptr};
 const char *const ListmakerRules[] = {"listmaker: test ( list_for | (',' test)* [','] )", nullptr};
 const char *const AtomExprRules[] = {"atom_expr: [AWAIT] atom trailer*", nullptr};
+const char *const NamedExprRules[] = {"namedexpr_test: test [':=' test]", nullptr};
 const char *const PowerRules[] = {"power: atom trailer* ['**' factor]", "power: atom_expr ['**' factor]",
                                   nullptr};
 
@@ -134,6 +138,7 @@ const std::vector<NodeClassRow> &nodeClassRows() {
       TL_NODE_OPS(CStringLiteral, CExpression, "STRING token.", nullptr, false, exprClass),
       TL_NODE_OPS(CFactorExpr, CExpression, "Unary '+', '-' or '~' applied to a factor.", nullptr, false,
                   exprClass),
+      TL_NODE(CNamedExpr, CExpression, "Assignment expression: NAME ':=' test.", NamedExprRules, false),
   };
   return Rows;
 }

@@ -102,6 +102,7 @@ enum class NodeClass : int {
   CNumberLiteral,
   CStringLiteral,
   CFactorExpr,
+  CNamedExpr,
   Count
 };
 

@@ -19,6 +19,7 @@ enum TokenCode : int {
   kEllipsis = 52,
   kAwait = 53,
   kAsync = 54,
+  kColonEqual = 55,
   kComment = 202,
   kBackslash = 203,
 };

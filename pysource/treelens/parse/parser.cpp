@@ -35,8 +35,8 @@ struct SynthToken {
 };
 
 struct SynthTokens {
-  SynthToken If, Zero, Colon, Pass, Newline, Try, Finally, Def, Function, LPar, RPar, Dot;
-  PyObject *Elif, *Except, *Else, *Async, *Await;
+  SynthToken If, Zero, Colon, Equal, Pass, Newline, Try, Finally, Def, Function, LPar, RPar, Dot;
+  PyObject *Elif, *Except, *Else, *Async, *Await, *InvalidSyntax;
 };
 SynthTokens Synth;
 
@@ -268,6 +268,37 @@ Ref takeStatement(ParserObject *P, Ref Root, bool Decorator) {
   return Decorators;
 }
 
+/// Whether the grammar has a label for token type Type (its `tokens` map).
+bool grammarHasToken(ParserObject *P, int Type) {
+  Ref Tokens = tl::require(PyObject_GetAttrString(P->Grammar, "tokens"));
+  Ref Key = tl::require(PyInt_FromLong(Type));
+  return tl::requireStatus(PySequence_Contains(Tokens.get(), Key.get())) != 0;
+}
+
+/// Feeds a `:=` token as the two operators ':' and '=' it is before 3.8. A
+/// grammar that rejects the '=' gets the SyntaxError at the '=' itself, one
+/// byte past the token's start, as those versions' own tokenizer places it.
+void addSplitColonEqual(ParserObject *P, Py_ssize_t TokI, PyObject *Context) {
+  addSynth(P, {&Synth.Colon}, Context);
+  try {
+    addSynth(P, {&Synth.Equal}, Context);
+  } catch (const tl::PyErrSet &) {
+    if (!P->Logical || !PyErr_ExceptionMatches(Host.ParseError))
+      throw;
+    PyErr_Clear();
+    Ref Error = createSyntaxError(Synth.InvalidSyntax, P->Logical, TokI);
+    Ref Offset = tl::require(PyObject_GetAttrString(Error.get(), "offset"));
+    Ref Next = tl::require(PyNumber_Add(Offset.get(), tl::require(PyInt_FromLong(1)).get()));
+    Ref Lineno = tl::require(PyObject_GetAttrString(Error.get(), "lineno"));
+    Ref Text = tl::require(PyObject_GetAttrString(Error.get(), "text"));
+    Ref Moved = tl::require(PyObject_CallFunction(PyExc_SyntaxError, const_cast<char *>("(O(sOOO))"),
+                                                  Synth.InvalidSyntax, "<string>", Lineno.get(), Next.get(),
+                                                  Text.get()));
+    PyErr_SetObject(PyExc_SyntaxError, Moved.get());
+    throw;
+  }
+}
+
 Ref parseTokens(ParserObject *P, const TokenSnapshot &S, bool AsyncKw) {
   engineSetup(P, P->FileInputNumber);
   bool First = true, Decorator = false;
@@ -307,6 +338,12 @@ Ref parseTokens(ParserObject *P, const TokenSnapshot &S, bool AsyncKw) {
       continue;
     if (TokType == kBackslash && S[I].Continuation)
       continue;
+    if (TokType == kColonEqual && !grammarHasToken(P, kColonEqual)) {
+      addSplitColonEqual(P, I, Context.get());
+      First = false;
+      LastType = Synth.Equal.Type;
+      continue;
+    }
     if (TokType == kEllipsis && !P->Py3Grammar) {
       addSynth(P, {&Synth.Dot, &Synth.Dot, &Synth.Dot}, Context.get());
       continue;
@@ -440,13 +477,14 @@ int parser_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
     Ref KeywordList = Ref::borrow(KeywordSeq == Py_None ? Host.KeywordList : KeywordSeq);
 
     Ref TokNumber2Name = tl::require(PyDict_Copy(Host.TokName));
-    for (auto Entry : {std::make_pair(51, "RARROW"), std::make_pair(54, "ASYNC"), std::make_pair(53, "AWAIT")}) {
+    for (auto Entry : {std::make_pair(51, "RARROW"), std::make_pair(54, "ASYNC"), std::make_pair(53, "AWAIT"),
+                       std::make_pair(55, "COLONEQUAL")}) {
       Ref K = tl::require(PyInt_FromLong(Entry.first));
       Ref V = tl::require(PyString_FromString(Entry.second));
       tl::requireStatus(PyDict_SetItem(TokNumber2Name.get(), K.get(), V.get()));
     }
     Ref OpText2Number = tl::require(PyDict_Copy(Host.OpMap));
-    for (auto Entry : {std::make_pair("...", 52), std::make_pair("->", 51)}) {
+    for (auto Entry : {std::make_pair("...", 52), std::make_pair("->", 51), std::make_pair(":=", 55)}) {
       Ref V = tl::require(PyInt_FromLong(Entry.second));
       tl::requireStatus(PyDict_SetItemString(OpText2Number.get(), Entry.first, V.get()));
     }
@@ -709,6 +747,7 @@ int initParserType(PyObject *Module) {
     Synth.If = makeSynth("if");
     Synth.Zero = makeSynth("0");
     Synth.Colon = makeSynth(":");
+    Synth.Equal = makeSynth("=");
     Synth.Pass = makeSynth("pass");
     Synth.Newline = makeSynth("\n");
     Synth.Try = makeSynth("try");
@@ -723,6 +762,7 @@ int initParserType(PyObject *Module) {
     Synth.Else = tl::internName("else");
     Synth.Async = tl::internName("async");
     Synth.Await = tl::internName("await");
+    Synth.InvalidSyntax = tl::internName("invalid syntax");
 
     tl::TypeDesc D;
     D.Name = "pysource.treelens.CPGenParserImpl";

@@ -408,6 +408,39 @@ void visitWithItem(NW *W, PyObject *Node) {
     visitStoreContextNode(W, Target.get(), false);
 }
 
+namespace {
+
+/// `Target := Value`: binds the target in the line's scope as an assignment
+/// does, also inside a comprehension (the language binds it in the enclosing
+/// scope), and reads the value.
+void bindNamedExpr(NW *W, PyObject *Target, PyObject *Value) {
+  appendEquivNode(W, Target, Value);
+  visitLoadContextNode(W, Value);
+}
+
+} // namespace
+
+// namedexpr_test: test ':=' test (a single test is promoted to its child)
+void visitNamedExpr(NW *W, PyObject *Node) {
+  NodeObject *N = asNodeOf(Node, C::CNamedExpr);
+  if (rawCount(N) != 3) {
+    visitChildren(W, Node);
+    return;
+  }
+  bindNamedExpr(W, obj(childAt(N, 0)), obj(childAt(N, 2)));
+}
+
+// argument: test ':=' test is an assignment expression; the other forms are
+// read child by child.
+void visitUsedArgument(NW *W, PyObject *Node) {
+  NodeObject *N = asNodeOf(Node, C::CSingleUsedArgumentNode);
+  if (rawCount(N) == 3 && childTextIs(N, 1, ":=")) {
+    bindNamedExpr(W, obj(childAt(N, 0)), obj(childAt(N, 2)));
+    return;
+  }
+  visitChildren(W, Node);
+}
+
 void processTargets(NW *W, PyObject *LhsIn, PyObject *Rhs) {
   // `(a) = 1` binds a: a parenthesized target is the target inside.
   Ref Dropped = isNodeOf(LhsIn, C::CAtom) ? dropSimpleParens(LhsIn) : Ref::borrow(LhsIn);
@@ -913,6 +946,11 @@ Ref typeEquivForNode(NW *W, PyObject *Node, PyObject *Extra) {
   }
   if (isNodeOf(Node, C::CTestListStarExpr) && testListIsTuple(N))
     return Ref::borrow(K.TupleInstance);
+  // `(y := v)` has the type of v.
+  if (isNodeOf(Node, C::CNamedExpr) && rawCount(N) == 3) {
+    Nesting Level(" while finding a type equivalence");
+    return typeEquivForNode(W, obj(childAt(N, 2)), Extra);
+  }
   if (isNodeOf(Node, C::CFactorExpr)) {
     Ref Op = factorGetUnaryOperator(N);
     if ((textIs(Op.get(), "+") || textIs(Op.get(), "-")) && rawCount(N) > 1) {

@@ -59,6 +59,8 @@ enum Row : unsigned char {
   RowDottedName,
   RowExceptClause,
   RowYield,
+  RowNamedExpr,
+  RowUsedArgument,
   RowOther
 };
 
@@ -66,7 +68,8 @@ const C RowClasses[RowOther] = {C::CWithItem,   C::CImportNamesStmt, C::CFromImp
                                 C::CForStmt,    C::CFuncdefStmt,     C::CReturnStmt,     C::CClassdefStmt,
                                 C::CLambdaExpr, C::CGlobalStmt,      C::CNonlocalStmt,   C::CPower,
                                 C::CAtomExpr,   C::CNameLiteral,     C::CCompForNode,    C::CSingleDecorator,
-                                C::CDottedName, C::CExceptClause,    C::CYieldExpr};
+                                C::CDottedName, C::CExceptClause,    C::CYieldExpr,      C::CNamedExpr,
+                                C::CSingleUsedArgumentNode};
 
 /// The row of each native node class, so that a node of a native class costs
 /// one table read; instances of Python subclasses take the class tests.
@@ -120,6 +123,8 @@ void dispatch(NW *W, PyObject *Node) {
   case RowDottedName: return visitDottedName(W, Node);
   case RowExceptClause: return visitExceptClause(W, Node);
   case RowYield: return visitYield(W, Node);
+  case RowNamedExpr: return visitNamedExpr(W, Node);
+  case RowUsedArgument: return visitUsedArgument(W, Node);
   case RowOther: return visitChildren(W, Node);
   }
 }

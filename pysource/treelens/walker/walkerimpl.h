@@ -47,6 +47,8 @@ TL_HIDDEN void visitAugAssign(NW *W, PyObject *Node);
 TL_HIDDEN void visitAnnotatedAssign(NW *W, PyObject *Node);
 TL_HIDDEN void visitForStmt(NW *W, PyObject *Node);
 TL_HIDDEN void visitWithItem(NW *W, PyObject *Node);
+TL_HIDDEN void visitNamedExpr(NW *W, PyObject *Node);
+TL_HIDDEN void visitUsedArgument(NW *W, PyObject *Node);
 TL_HIDDEN void processTargets(NW *W, PyObject *Lhs, PyObject *Rhs);
 TL_HIDDEN void appendEquivNode(NW *W, PyObject *NameNode, PyObject *EquivNode);
 TL_HIDDEN void processNamesFound(NW *W, PyObject *Node);
