@@ -1150,7 +1150,11 @@ void Checker::call(N *Args, const Scope &S) {
       report(kAst, A, "only named arguments may follow *expression");
       return;
     }
-    load(A, S);
+    // f(x := 1): the argument holds the assignment expression's parts itself.
+    if (Arg && count(A) == 3 && textIs(child(A, 1), ":="))
+      namedExpr(A, S);
+    else
+      load(A, S);
   }
 }
 
