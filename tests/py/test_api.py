@@ -43,7 +43,7 @@ class VersionTest(unittest.TestCase):
                  (b'x = 0; y = 00; z = 0.5 + 07.5 + 0e1 + 0777j\n', '2.7 3.5 3.6 3.7 3.8'),
                  # async and await: names up to 3.6, keywords everywhere from 3.7.
                  (b'async = await = 1\n', '2.7 3.5 3.6'),
-                 (b'def f():\n    return [await x async for x in y]\n', '3.7 3.8'),
+                 (b'def f():\n    return (await x async for x in y)\n', '3.7 3.8'),
                  # 3.8: assignment expressions, positional-only parameters, starred returns.
                  (b'if (n := len(a)) > 1: f(x := 2)\n', '3.8'),
                  (b'def f(a, /, b): return *a, b\n', '3.8'),

@@ -319,6 +319,7 @@ struct Scope {
   N *ComprehensionAt = nullptr;                ///< the comprehension, where CPython places its errors
   std::vector<std::string> *IterVars = nullptr; ///< a comprehension's iteration variables
   bool InIterable = false;                     ///< in the iterable of a comprehension clause
+  bool *Awaits = nullptr;                      ///< set when the comprehension awaits
 };
 
 /// How CPython gives the offset of an error.
@@ -1012,6 +1013,8 @@ void Checker::atomExpr(N *X, const Scope &S) {
       report(kCompile, X, "'await' outside function");
     else if (S.B != Block::AsyncFunction && S.B != Block::Comprehension)
       report(kCompile, X, "'await' outside async function");
+    if (S.B == Block::Comprehension && S.Awaits)
+      *S.Awaits = true;
     I = 1;
   }
   for (; I < count(X); ++I) {
@@ -1164,6 +1167,8 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
   bool NewScope = Py3 || !List;
   Scope Inner{Block::Comprehension, &S};
   Inner.NoLoop = true;
+  bool Awaits = false;
+  Inner.Awaits = &Awaits;
   Inner.ComprehensionAt = At;
   Inner.Comprehension = List ? "list comprehension"
                              : symOf(At) != Sym::Atom || textIs(child(At, 0), "(") ? "generator expression"
@@ -1246,7 +1251,10 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
     }
     C = Next;
   }
-  if (Async && Py3) {
+  // A comprehension that awaits or iterates asynchronously must be in an async
+  // def, but for a generator expression from 3.7 on.
+  bool GenExp = NewScope && !List && (symOf(At) != Sym::Atom || textIs(child(At, 0), "("));
+  if ((Async || Awaits) && Py3 && !(GenExp && Minor >= 7)) {
     const Scope *F = function(S);
     while (F && F->B == Block::Comprehension)
       F = F->Outer ? function(*F->Outer) : nullptr;
@@ -1780,7 +1788,7 @@ void Checker::raise() {
     if (P == kParse)
       OffsetObj = tl::require(PyInt_FromLong(Col + 1 + F.ColDelta));
     else if (Py3)
-      OffsetObj = tl::require(PyInt_FromLong(F.How == Offset::LineStart ? 0
+      OffsetObj = tl::require(PyInt_FromLong(F.How == Offset::LineStart ? (Py38 ? 1 : 0)
                                           : F.How == Offset::ZeroBased || !Py38 ? Col
                                                                               : Col + 1));
     Ref Error = tl::require(PyObject_CallFunction(PyExc_SyntaxError, const_cast<char *>("(O(slOO))"), Msg.get(),
