@@ -243,14 +243,16 @@ N *firstLeaf(N *X) {
   return X;
 }
 
-/// A string token with an f prefix.
-inline bool isFString(N *X) {
+/// Whether a string token's prefix has the letter Lower, in either case.
+inline bool prefixHas(N *X, char Lower) {
   const char *T = text(X);
   for (; *T && *T != '\'' && *T != '"'; ++T)
-    if (*T == 'f' || *T == 'F')
+    if (*T == Lower || *T == Lower - 'a' + 'A')
       return true;
   return false;
 }
+
+inline bool isFString(N *X) { return prefixHas(X, 'f'); }
 
 /// The await keyword (a plain name where the version has no such keyword).
 inline bool isAwait(N *X) {
@@ -947,21 +949,12 @@ void Checker::elements(N *X, const Scope &S, bool StarOk) {
 
 void Checker::starred(N *X, const Scope &) { report(kCompile, X, "can't use starred expression here"); }
 
-/// A string token with a b prefix.
-inline bool isBytes(N *X) {
-  const char *T = text(X);
-  for (; *T && *T != '\'' && *T != '"'; ++T)
-    if (*T == 'b' || *T == 'B')
-      return true;
-  return false;
-}
-
 void Checker::atom(N *X, const Scope &S) {
   if (symOf(child(X, 0)) == Sym::String) {
     // Adjacent literals join into one: Python 3 cannot join bytes and text.
     int Bytes = 0;
     for (Py_ssize_t I = 0; I < count(X); ++I)
-      Bytes += isBytes(child(X, I));
+      Bytes += prefixHas(child(X, I), 'b');
     if (Py3 && Bytes && Bytes < count(X))
       report(kAst, X, "cannot mix bytes and nonbytes literals");
     return;
@@ -1596,12 +1589,13 @@ void Checker::countStars(N *X, bool Top) {
 /// One assignment target: its expressions first, then whether it can be bound.
 void Checker::target(N *X, bool Del, N *Loc, const Scope &S) {
   // The target's own expressions, with its starred items allowed.
-  std::vector<N *> Todo{X};
+  std::vector<N *> Todo{X}, Stars;
   while (!Todo.empty()) {
     N *Y = strip(Todo.back());
     Todo.pop_back();
     Kind K = kindOf(Y);
     if (K == Kind::Starred) {
+      Stars.push_back(Y);
       Todo.push_back(child(Y, 1));
     } else if (N *Seq = sequenceOf(Y, K)) {
       for (Py_ssize_t I = count(Seq); I-- > 0;)
@@ -1616,21 +1610,8 @@ void Checker::target(N *X, bool Del, N *Loc, const Scope &S) {
   setContext(X, Del, Loc);
   if (Del) {
     // del *a: a starred item has nowhere to go.
-    std::vector<N *> Stars{X};
-    while (!Stars.empty()) {
-      N *Y = strip(Stars.back());
-      Stars.pop_back();
-      Kind K = kindOf(Y);
-      if (K == Kind::Starred) {
-        starred(Y, S);
-      } else if (N *Seq = sequenceOf(Y, K)) {
-        for (Py_ssize_t I = count(Seq); I-- > 0;)
-          if (!textIs(child(Seq, I), ","))
-            Stars.push_back(child(Seq, I));
-      } else if (K == Kind::List && symOf(Y) == Sym::Atom && count(Y) == 3) {
-        Stars.push_back(child(Y, 1));
-      }
-    }
+    if (!Stars.empty())
+      starred(Stars.front(), S);
   } else if (Py3) {
     countStars(X, true);
   }
