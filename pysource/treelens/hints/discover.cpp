@@ -247,18 +247,8 @@ void visitExprStmt(HW *W, PyObject *Node) {
 
 void processTarget(HW *W, PyObject *Statement, PyObject *Target) {
   Ref Hint = findEndingTypeComment(W, Statement);
-  if (Hint.get() == Py_None)
-    return;
-  Ref HintNode = parsedHintExpression(W, parseHint(W, Hint.get()));
-  if (HintNode.get() == Py_None)
-    return;
-  bool Ok = tl::guard<bool>(false, [&] {
-    processNameAndHintNodes(W, Target, HintNode.get(), false);
-    return true;
-  });
-  discardHint(W, HintNode.get());
-  if (!Ok)
-    throw tl::PyErrSet();
+  if (Hint.get() != Py_None)
+    recordHintText(W, Target, Hint.get(), false);
 }
 
 // ---- Finding the comment ----
@@ -371,18 +361,8 @@ void processArgSpecificComment(HW *W, PyObject *Arg) {
     return;
   Ref Comment = Ref::borrow(L->Texts[End] ? L->Texts[End] : Py_None);
   Ref Hint = getHintFromComment(Comment.get());
-  if (Hint.get() == Py_None)
-    return;
-  Ref HintNode = parsedHintExpression(W, parseHint(W, Hint.get()));
-  if (HintNode.get() == Py_None)
-    return;
-  bool Ok = tl::guard<bool>(false, [&] {
-    processNameAndHintNodes(W, Name.get(), HintNode.get(), true);
-    return true;
-  });
-  discardHint(W, HintNode.get());
-  if (!Ok)
-    throw tl::PyErrSet();
+  if (Hint.get() != Py_None)
+    recordHintText(W, Name.get(), Hint.get(), true);
 }
 
 } // namespace hints

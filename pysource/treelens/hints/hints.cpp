@@ -204,20 +204,13 @@ int initHintTypes(PyObject *Module) {
     HK.VisitWith = ownMethod("_VisitWithStmt");
     tl::requireStatus(tl::addType(Module, "CTypeHintWalker", TypeHintWalkerType));
     using F = tl::FieldKind;
-    using DW = walker::DispatchWalkerObject;
-    tl::registerPickle(TypeHintWalkerType,
-                       {{"_fLogical", F::Object, offsetof(DW, Logical)},
-                        {"_fDispatchDict", F::Object, offsetof(DW, DispatchDict), &PyDict_Type},
-                        {"_fVisitCount", F::Int, offsetof(DW, VisitCount)},
-                        {"_fRecurseCount", F::Int, offsetof(DW, RecurseCount)},
-                        {"_fMaxVisits", F::Int, offsetof(DW, MaxVisits)},
-                        {"_fMaxRecurseCount", F::Int, offsetof(DW, MaxRecurseCount)},
-                        {"_fNodeStack", F::Object, offsetof(DW, NodeStack), &PyList_Type},
-                        {"_fNameConv", F::Object, offsetof(HW, NameConv), &nodeToTextConverterType()},
-                        {"_fHintConv", F::Object, offsetof(HW, HintConv), &nodeToTextConverterType()},
-                        {"_fCommentHintCount", F::Int, offsetof(HW, CommentHintCount)},
-                        {"_fHintParser", F::Object, offsetof(HW, HintParser), &parserType()}},
-                       host::Host.UnpickleFields);
+    std::vector<tl::FieldSpec> Fields = walker::dispatchWalkerFields();
+    Fields.insert(Fields.end(),
+                  {{"_fNameConv", F::Object, offsetof(HW, NameConv), &nodeToTextConverterType()},
+                   {"_fHintConv", F::Object, offsetof(HW, HintConv), &nodeToTextConverterType()},
+                   {"_fCommentHintCount", F::Int, offsetof(HW, CommentHintCount)},
+                   {"_fHintParser", F::Object, offsetof(HW, HintParser), &parserType()}});
+    tl::registerPickle(TypeHintWalkerType, std::move(Fields), host::Host.UnpickleFields);
     return 0;
   });
 }

@@ -65,6 +65,9 @@ TL_HIDDEN tl::Ref parseHintTokList(HW *W, PyObject *Tokens);
 TL_HIDDEN tl::Ref parsedHintExpression(HW *W, tl::Ref Parsed);
 /// Returns a hint tree to the hint parser's free lists, keeping a pending exception.
 TL_HIDDEN void discardHint(HW *W, PyObject *Node);
+/// Parses a hint text and records it for Target (processNameAndHintNodes);
+/// the tree goes back to the free lists whatever happens.
+TL_HIDDEN void recordHintText(HW *W, PyObject *Target, PyObject *Hint, bool IsArg);
 TL_HIDDEN tl::Ref rewriteFuncdefCommentHint(PyObject *Hint);
 TL_HIDDEN void processFuncdefComment(HW *W, PyObject *Hint, PyObject *FuncdefLogical, bool IsArg);
 TL_HIDDEN void processArgSpecificComment(HW *W, PyObject *Arg);

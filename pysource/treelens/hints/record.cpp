@@ -164,6 +164,19 @@ Ref parsedHintExpression(HW *W, Ref Parsed) {
   return none();
 }
 
+void recordHintText(HW *W, PyObject *Target, PyObject *Hint, bool IsArg) {
+  Ref HintNode = parsedHintExpression(W, parseHint(W, Hint));
+  if (HintNode.get() == Py_None)
+    return;
+  bool Ok = tl::guard<bool>(false, [&] {
+    processNameAndHintNodes(W, Target, HintNode.get(), IsArg);
+    return true;
+  });
+  discardHint(W, HintNode.get());
+  if (!Ok)
+    throw tl::PyErrSet();
+}
+
 // SIGNATURE: '(' [TYPE (',' TYPE)*] ')' '->' TYPE, rewritten to
 //   'def' 'function' '(' 'a' ':' TYPE (',' 'a' ':' TYPE)* ')' '->' TYPE ':'
 // "(...)" gives no parameters; "*T" and "**T" become "*a : T" and "**a : T". Only positions count,

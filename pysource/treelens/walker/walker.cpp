@@ -636,6 +636,18 @@ PyMemberDef DispatchWalkerMembers[] = {
 
 } // namespace
 
+std::vector<tl::FieldSpec> dispatchWalkerFields() {
+  using F = tl::FieldKind;
+  using DW = DispatchWalkerObject;
+  return {{"_fLogical", F::Object, offsetof(DW, Logical)},
+          {"_fDispatchDict", F::Object, offsetof(DW, DispatchDict), &PyDict_Type},
+          {"_fVisitCount", F::Int, offsetof(DW, VisitCount)},
+          {"_fRecurseCount", F::Int, offsetof(DW, RecurseCount)},
+          {"_fMaxVisits", F::Int, offsetof(DW, MaxVisits)},
+          {"_fMaxRecurseCount", F::Int, offsetof(DW, MaxRecurseCount)},
+          {"_fNodeStack", F::Object, offsetof(DW, NodeStack), &PyList_Type}};
+}
+
 int initWalkerTypes(PyObject *Module) {
   return tl::guard<int>(-1, [&] {
     WalkName = tl::internName("Walk");
@@ -688,15 +700,7 @@ int initWalkerTypes(PyObject *Module) {
     DD.New = PyType_GenericNew;
     tl::requireStatus(tl::readyType(DispatchWalkerType, DD));
     tl::requireStatus(tl::addType(Module, "CDispatchWalker", DispatchWalkerType));
-    tl::registerPickle(DispatchWalkerType,
-                       {{"_fLogical", F::Object, offsetof(DispatchWalkerObject, Logical)},
-                        {"_fDispatchDict", F::Object, offsetof(DispatchWalkerObject, DispatchDict), &PyDict_Type},
-                        {"_fVisitCount", F::Int, offsetof(DispatchWalkerObject, VisitCount)},
-                        {"_fRecurseCount", F::Int, offsetof(DispatchWalkerObject, RecurseCount)},
-                        {"_fMaxVisits", F::Int, offsetof(DispatchWalkerObject, MaxVisits)},
-                        {"_fMaxRecurseCount", F::Int, offsetof(DispatchWalkerObject, MaxRecurseCount)},
-                        {"_fNodeStack", F::Object, offsetof(DispatchWalkerObject, NodeStack), &PyList_Type}},
-                       host::Host.UnpickleFields);
+    tl::registerPickle(DispatchWalkerType, dispatchWalkerFields(), host::Host.UnpickleFields);
     return 0;
   });
 }

@@ -2,7 +2,10 @@
 #ifndef TREELENS_WALKER_WALKER_H
 #define TREELENS_WALKER_WALKER_H
 
+#include "fieldpickle.h"
 #include "pyref.h"
+
+#include <vector>
 
 namespace treelens {
 namespace walker {
@@ -55,6 +58,8 @@ TL_HIDDEN int dispatchWalkerTraverse(PyObject *Self, visitproc Visit, void *Arg)
 TL_HIDDEN int dispatchWalkerClear(PyObject *Self);
 /// Sets the CDispatchWalker fields as the constructor does. Throws PyErrSet.
 TL_HIDDEN void dispatchWalkerSetUp(DispatchWalkerObject *W, PyObject *DispatchDict);
+/// The pickled fields of CDispatchWalker, which classes of its layout extend.
+TL_HIDDEN std::vector<tl::FieldSpec> dispatchWalkerFields();
 
 /// Writes "RuntimeError raised in CNodeWalker.Walk: <repr>" for the pending
 /// RuntimeError to the host's sys.stdout and clears it.
