@@ -80,7 +80,10 @@ def LoadLogicals(limit):
     return logicals
 
 
-def TimeTreelens(analyzer, logicals, repeat):
+def TimeTreelens(analyzer, logicals, repeat, in_async=None, results=None):
+    """Best seconds of AnalyzeSingleLogical over the logicals; in_async gives each
+    line's in_async_def (False by default); results, a list, gets the last run's."""
+    flags = in_async or [False] * len(logicals)
     best = None
     for _ in range(repeat):
         for logical in logicals:
@@ -88,30 +91,21 @@ def TimeTreelens(analyzer, logicals, repeat):
         gc.collect()
         analyze = analyzer.AnalyzeSingleLogical
         start = time.time()
-        for logical in logicals:
-            analyze(logical, False)
+        found = [analyze(logical, flag) for logical, flag in zip(logicals, flags)]
         elapsed = time.time() - start
         best = elapsed if best is None else min(best, elapsed)
+    if results is not None:
+        results[:] = found
     return best
 
 
 def TimeVersion(version, logicals, repeat):
     """Best seconds of the version's analyzer over the logicals, and how many it rejects."""
     from pysource import analysis
-    analyzer = analysis.GetAnalyzer(version).Impl()
     flags = [version < '3.7' and support.InAsyncDef(l) for l in logicals]
-    best, rejected = None, 0
-    for _ in range(repeat):
-        for logical in logicals:
-            logical.fInspected = False
-        gc.collect()
-        analyze = analyzer.AnalyzeSingleLogical
-        start = time.time()
-        results = [analyze(logical, in_async) for logical, in_async in zip(logicals, flags)]
-        elapsed = time.time() - start
-        best = elapsed if best is None else min(best, elapsed)
-        rejected = sum(1 for r in results if r is not None)
-    return best, rejected
+    results = []
+    best = TimeTreelens(analysis.GetAnalyzer(version).Impl(), logicals, repeat, flags, results)
+    return best, sum(1 for r in results if r is not None)
 
 
 def TimeParseOnly(logicals, repeat):

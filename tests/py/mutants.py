@@ -146,6 +146,23 @@ def Compare(version, count, seed=4321, checks=True):
     return items, theirs, [Ours(version, s, checks) for s, _ in items]
 
 
+class Judgement(object):
+    """The analyzer's verdicts against CPython's: rejected (how many CPython
+    rejects), false_rejects and false_accepts and other_message (lists of
+    (context, source, cpython's, ours)), same_message and same_place (counts)."""
+
+    def __init__(self, items, theirs, ours):
+        cases = [(ctx, src, t, o) for (src, ctx), t, o in zip(items, theirs, ours)]
+        self.count = len(cases)
+        self.rejected = sum(1 for _, _, t, _ in cases if t is not None)
+        self.false_rejects = [c for c in cases if c[2] is None and c[3] is not None]
+        self.false_accepts = [c for c in cases if c[2] is not None and c[3] is None]
+        agree = [(t, o) for _, _, t, o in cases if t is not None and o is not None]
+        self.other_message = [c for c in cases if c[2] is not None and c[3] is not None and c[2][0] != c[3][0]]
+        self.same_message = sum(1 for t, o in agree if t[0] == o[0])
+        self.same_place = sum(1 for t, o in agree if t == o)
+
+
 def Main(argv):
     version = argv[1]
     count = int(argv[2]) if len(argv) > 2 else 20000
@@ -153,26 +170,19 @@ def Main(argv):
     if found is None:
         print('no CPython %s' % version)
         return 1
-    items, theirs, ours = found
-    rejected = sum(1 for t in theirs if t is not None)
-    false_reject = [(i, t, o) for i, (t, o) in enumerate(zip(theirs, ours)) if t is None and o]
-    false_accept = [(i, t, o) for i, (t, o) in enumerate(zip(theirs, ours)) if t and o is None]
-    same_msg = sum(1 for t, o in zip(theirs, ours) if t and o and t[0] == o[0])
-    same_loc = sum(1 for t, o in zip(theirs, ours) if t and o and t[0] == o[0] and t[1:] == o[1:])
-    for kind, cases in (('ACCEPTED BY CPYTHON, REJECTED', false_reject),
-                        ('REJECTED BY CPYTHON, ACCEPTED', false_accept)):
+    j = Judgement(*found)
+    for kind, cases in (('ACCEPTED BY CPYTHON, REJECTED', j.false_rejects),
+                        ('REJECTED BY CPYTHON, ACCEPTED', j.false_accepts),
+                        ('OTHER MESSAGE', j.other_message)):
         print('== %s: %d' % (kind, len(cases)))
-        for i, t, o in cases:
-            print('%-8s %r\n         cpython %r ours %r' % (items[i][1], items[i][0], t, o))
-    wrong = [(i, t, o) for i, (t, o) in enumerate(zip(theirs, ours)) if t and o and t[0] != o[0]]
-    print('== OTHER MESSAGE: %d' % len(wrong))
-    for i, t, o in wrong:
-        print('%-8s %r\n         cpython %r ours %r' % (items[i][1], items[i][0], t, o))
+        for ctx, src, t, o in cases:
+            print('%-8s %r\n         cpython %r ours %r' % (ctx, src, t, o))
+    rejected = max(j.rejected, 1)
     print('%d mutants, %d rejected by CPython; false rejects %d, false accepts %d (%.3f%%), '
           'same message %d (%.1f%%), same message and place %d'
-          % (len(items), rejected, len(false_reject), len(false_accept),
-             100.0 * len(false_accept) / max(rejected, 1), same_msg,
-             100.0 * same_msg / max(rejected, 1), same_loc))
+          % (j.count, j.rejected, len(j.false_rejects), len(j.false_accepts),
+             100.0 * len(j.false_accepts) / rejected, j.same_message,
+             100.0 * j.same_message / rejected, j.same_place))
     return 0
 
 

@@ -224,16 +224,12 @@ class ChecksTest(unittest.TestCase):
             found = mutants.Compare(version, kMutants)
             if found is None:
                 continue
-            items, theirs, ours = found
-            rejected = [(i, t, o) for i, (t, o) in enumerate(zip(theirs, ours)) if t is not None]
-            self.assertGreater(len(rejected), kMutants // 2)
-            false_rejects = [(items[i][0], o) for i, (t, o) in enumerate(zip(theirs, ours))
-                             if t is None and o is not None]
-            self.assertEqual(false_rejects, [], version)
-            false_accepts = [(items[i][0], t) for i, t, o in rejected if o is None]
-            self.assertLessEqual(len(false_accepts), len(rejected) // 1000, (version, false_accepts))
-            same = sum(1 for _, t, o in rejected if o is not None and t[0] == o[0])
-            self.assertGreaterEqual(same, 0.95 * len(rejected), version)
+            judged = mutants.Judgement(*found)
+            self.assertGreater(judged.rejected, kMutants // 2)
+            self.assertEqual(judged.false_rejects, [], version)
+            self.assertLessEqual(len(judged.false_accepts), judged.rejected // 1000,
+                                 (version, judged.false_accepts))
+            self.assertGreaterEqual(judged.same_message, 0.95 * judged.rejected, version)
 
 
 if __name__ == '__main__':
