@@ -25,6 +25,7 @@ import os
 import re
 
 from pysource import _fastaccess
+from pysource import filechecks
 from pysource import symbolinfo
 from pysource import utils
 
@@ -385,7 +386,7 @@ def GetAnalyzer(version, checks=True):
     return analyzer
 
 
-def _AnalyzeAuto(logicals, checks):
+def _AnalyzeAuto(logicals, checks, text=None, path=None):
     """(version, errors) for 'auto': the newest version with no syntax error."""
     failed = None
     for version in kAutoOrder:
@@ -398,8 +399,13 @@ def _AnalyzeAuto(logicals, checks):
         if errors and errors[-1] is not None:
             failed = logicals[len(errors) - 1]
             continue
+        filechecks.Check(version, logicals, errors, text, path, checks)
+        if any(e is not None for e in errors):
+            continue
         return version, errors
-    return kAutoOrder[0], GetAnalyzer(kAutoOrder[0], checks).Analyze(logicals)
+    errors = GetAnalyzer(kAutoOrder[0], checks).Analyze(logicals)
+    filechecks.Check(kAutoOrder[0], logicals, errors, text, path, checks)
+    return kAutoOrder[0], errors
 
 
 class FileAnalysis(object):
@@ -509,9 +515,10 @@ def AnalyzeText(text, version=kAuto, path=None, checks=True):
                             % (line, column))
     logicals = utils.GetLogicalsFromText(text)
     if version == kAuto:
-        version, errors = _AnalyzeAuto(logicals, checks)
+        version, errors = _AnalyzeAuto(logicals, checks, text, path)
     else:
         errors = GetAnalyzer(version, checks).Analyze(logicals)
+        filechecks.Check(version, logicals, errors, text, path, checks)
     failed = any(e is not None for e in errors)
     return FileAnalysis(path, version, logicals, errors, kSyntaxError if failed else kOk)
 
