@@ -63,13 +63,23 @@ class _Found(object):
             return
         current = self.errors[index]
         if old is None and current is not None:
+            # The parser's and lexer's own errors on the line come first,
+            # but for a lexer error further left.
             if rank == _kCompile:
+                return
+            if rank == _kParse and not _AfterParsing(current) and (before is None
+                                                                   or _Where(current) <= before):
                 return
             if rank == _kLexer and before is not None and _Where(current) < before:
                 return
         self.ranks[index] = rank
         self.errors[index] = error
         _fastaccess.ClearLogicalDerivedInfo(self.logicals[index])
+
+
+def _AfterParsing(error):
+    """Whether an analyzer's error is one of the checks after parsing (they carry a column)."""
+    return hasattr(error, 'column')
 
 
 def _Where(error):
@@ -273,10 +283,14 @@ def _EndOfFile(py3, logicals, index, comment_message, found):
         last -= 1
     logical = logicals[last]
     if last == index:
-        tokens = logical.fTokens
-        text, (row, col) = tokens[-1]
+        text, (row, col) = logical.fTokens[-1]
         end = col + len(text)
-        found.Add(_kParse, index, MakeError(logical, kEof, row, end, end + 1))
+        message, cls = kEof, SyntaxError
+        if not py3 and sum(l.fLineText.count(b'\n') for l in logicals) > 1:
+            # CPython 2 says so only for a one-line file.
+            message, cls = comment_message
+        found.Add(_kParse, index, MakeError(logical, message, row, end, end + 1, cls),
+                  (row + 1, end + 1))
         return
     # CPython reaches the end of the file past the comments after it.
     comment = logical.GetTokenString(0) if logical.fTokenCount else b''
@@ -404,7 +418,8 @@ def _Decorators(py3, logicals, statements, found):
         if words[:1] in ([b'@'], [b'def'], [b'class']) or (py3 and words == [b'async', b'def']):
             continue
         row, col = after.fTokens[_SignificantTokens(after)[0]][1] if words else (0, 0)
-        found.Add(_kParse, statements[k + 1], MakeError(after, 'invalid syntax', row, col, col + 1))
+        found.Add(_kParse, statements[k + 1], MakeError(after, 'invalid syntax', row, col, col + 1),
+                  (row + 1, col + 1))
 
 
 # ---- after parsing

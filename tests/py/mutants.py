@@ -2,8 +2,10 @@
 
 One-line statements of a standard library are mutated once or twice (a token
 deleted, inserted from a pool, swapped with its neighbour or replaced), put in
-a random enclosing block (module, def, class, loop, async def) and compiled by
-the CPython of the same version. Run as a script to print the disagreements:
+a random enclosing block (module, def, class, loop, async def), a quarter of
+them damaged as only the whole file shows (indentation, a stray decorator, a
+late future import, a header with no body, a break or continue on a line of
+its own) and compiled by the CPython of the same version. Run as a script to print the disagreements:
 
     python2.7 -m tests.py.mutants 3.6 [count]
 """
@@ -67,9 +69,26 @@ def Mutate(toks, rnd):
     return toks
 
 
+def Damage(head, indent, line, rnd):
+    """The lines of a source (head, then line at indent) with one whole-file damage."""
+    kind = rnd.randrange(5)
+    if kind == 0:       # the line's indentation
+        indent = rnd.choice((indent + b' ', indent[:-1], indent.replace(b'    ', b'\t', 1),
+                             b'\t' + indent, indent + b'  '))
+        return head + indent + line
+    if kind == 1:       # a decorator that no def or class may follow
+        return head + indent + b'@d\n' + indent + line
+    if kind == 2:       # a future import after other statements
+        return head + indent + line + b'from __future__ import division\n'
+    if kind == 3:       # a header that ends the file
+        return head + indent + line + indent + b'if _c:\n'
+    return head + indent + line + indent + rnd.choice((b'break\n', b'continue\n'))
+
+
 def Sources(version, count, seed=4321, files=None):
     """(source, context) of `count` distinct mutated statements in random blocks."""
     rnd = random.Random(seed)
+    damage = random.Random(seed + 1)
     statements = Statements(version, files if files is not None else support.CorpusFiles(version, 400, seed))
     contexts = sorted(k for k in kContexts if version != '2.7' or k != 'async')
     seen, out = set(), []
@@ -83,9 +102,13 @@ def Sources(version, count, seed=4321, files=None):
         seen.add(line)
         context = rnd.choice(contexts)
         head, indent = kContexts[context]
-        source = head + indent + line + b'\n'
+        line += b'\n'
         if toks[-1] == b':':
-            source += indent + b'    pass\n'
+            line += indent + b'    pass\n'
+        if damage.random() < 0.25:
+            source, context = Damage(head, indent, line, damage), context + '+file'
+        else:
+            source = head + indent + line
         out.append((source, context))
     return out
 
