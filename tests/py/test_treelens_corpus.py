@@ -2,7 +2,7 @@
 checked against CPython's own compiler.
 
 Every logical line of a file that CPython compiles must analyze to None with
-the grammar of the same version; a line that yields a SyntaxError must be one
+the grammar of the same version, and the whole-file checks find nothing in it; a line that yields a SyntaxError must be one
 that CPython also rejects (its source, completed as the analyzer completes its
 tokens, does not compile). What each analyzed line records is checked against
 CPython's ast of the same completed line (tests/py/astfacts.py; the 3.x side
@@ -25,6 +25,7 @@ from tests.py import support
 try:
     from pysource import treelens as tl
     from pysource import analysis
+    from pysource import filechecks
     from pysource import symbolinfo as si
     from pysource.utils import GetLogicalsFromText
     sys.path.insert(0, os.path.join(support.kRoot, 'bench'))
@@ -55,6 +56,16 @@ def Analyze(analyzer, text, async_scopes, counts, analyzed=None):
         elif analyzed is not None:
             analyzed.append(logical)
     return failed
+
+
+def FileErrors(version, path, text):
+    """What only the whole file shows (encoding, indentation, decorators, ...):
+    a description per line given an error."""
+    logicals = GetLogicalsFromText(text)
+    errors = [None] * len(logicals)
+    filechecks.Check(version, logicals, errors, text, path)
+    return ['%s:%d: whole file: %s' % (path, l.fFirstLine + 1, e.msg)
+            for l, e in zip(logicals, errors) if e is not None]
 
 
 kWord = re.compile(br'[A-Za-z_][A-Za-z_0-9]*')
@@ -197,6 +208,7 @@ class Corpus27Test(unittest.TestCase):
                 judge.Add(path, analyzed)
             if Compiles27(text):
                 wrong.extend(Describe(path, l, r) for l, r in failed)
+                wrong.extend(FileErrors('2.7', path, text))
                 continue
             rejected_files += 1
             wrong.extend(Describe(path, l, r) for l, r in failed if Compiles27(CompletedSource(l)))
@@ -228,6 +240,8 @@ class Corpus3Test(unittest.TestCase):
                     wrong.append(Describe(path, logical, result))
                 else:
                     suspects.append((len(suspects), (path, logical, result)))
+            if path in compiling:
+                wrong.extend(FileErrors(version, path, text))
             judge.Add(path, analyzed)
         judge.Flush()
         accepted = OracleCompiles(version, [(i, CompletedSource(l)) for i, (_, l, _) in suspects])
