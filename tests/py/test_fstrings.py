@@ -160,13 +160,14 @@ class PartListTest(unittest.TestCase):
 class InspectionTest(unittest.TestCase):
 
     def testErrorsAreLocatedInTheOuterLine(self):
+        kEnd = 'unexpected EOF while parsing'
         cases = [
             (b"x = f'{a b}'\n", 1, 10),
             (b"x = rf'{a b}'\n", 1, 11),
             (b"x = (1,\n    f'{a b}')\n", 2, 10),
             (b"x = f'''\n  {a b}'''\n", 2, 6),
             (b"x = f'''{\na b}'''\n", 2, 3),
-            (b"x = f'{a}' f'{b +}'\n", 1, 18),
+            (b"x = f'{a}' f'{b +}'\n", 1, 18, kEnd),  # at the end of the field's parentheses
             (b"""x = f'{f"{a b}"}'\n""", 1, 13),
             (b"x = f'{a)}b'\n", 1, 9),
             # The grammar parses a field as a whole line; statements are errors there.
@@ -175,11 +176,12 @@ class InspectionTest(unittest.TestCase):
             (b"x = f'{del y}'\n", 1, 8),
             (b"x = f'{a; b}'\n", 1, 9),
         ]
-        for source, line, column in cases:
+        for case in cases:
+            source, line, column = case[:3]
             logical, result = Analyze(source)
             self.assertIsInstance(result, SyntaxError, source)
             self.assertEqual((result.msg, result.filename, result.lineno, result.offset),
-                             ('invalid syntax', '<string>', line, column), source)
+                             (case[3] if len(case) > 3 else 'invalid syntax', '<string>', line, column), source)
             self.assertEqual(result.text, logicalinspect.TextFromTokens(logical))
             self.assertEqual((logical.fNamesDefined, logical.fTypeEquivs), ([], []), source)
         analyzer = tl.CPGenAnalyzerImpl((3, 6, 0))
@@ -192,8 +194,13 @@ class InspectionTest(unittest.TestCase):
     def testValidLines(self):
         for source in [b"f'{x!r:>{width}} {a != b} { {1: 2}[1] } {(lambda y=1: y)()}'\n",
                        b"""f'{d["]"]} {s.split("(")} {f"{g}"} {x:%H:%M}'\n""",
-                       b"f'''{3+\n4} \\N{DASH}'''\n", b"rf'{x}' 'a{b c}' b'{b c}'\n"]:
+                       b"f'''{3+\n4} \\N{DASH}'''\n", b"rf'{x}' 'a{b c}' b'{b c}'\n",
+                       b"f'{a for a in b}'\n"]:  # read in parentheses, as the language reads a field
             self.assertIsNone(Analyze(source)[1], source)
+        # 3.6 reads a field without the keywords of the async def around it; 3.7 has them everywhere.
+        source = b"x = f'{await y}'\n"
+        self.assertIsInstance(tl.CPGenAnalyzerImpl((3, 6, 0)).AnalyzeSingleLogical(First(source), True), SyntaxError)
+        self.assertIsNone(tl.CPGenAnalyzerImpl((3, 7, 0)).AnalyzeSingleLogical(First(source), True))
 
     def testFindingsAreCopied(self):
         class Planted(tl.CFStringSupport):

@@ -331,6 +331,7 @@ enum class Offset : uint8_t {
   LineStart, ///< 0 whatever the node
   ZeroBased, ///< the node's 0-based column in every version
   FString,   ///< as Node; before 3.8 a string over several lines gives its last line and offset -1
+  OneBased,  ///< the 1-based column, as the parser gives it
 };
 
 struct Found {
@@ -1916,7 +1917,7 @@ void Checker::fieldExpression(N *Tok, Py_ssize_t Begin, Py_ssize_t End, const Sc
   if (!PyList_Check(Logicals.get()) || PyList_GET_SIZE(Logicals.get()) != 1 ||
       !host::isLogical(PyList_GET_ITEM(Logicals.get(), 0))) {
     // The text ends the parenthesis and goes on over another line.
-    report(kAst, Tok, "invalid syntax");
+    report(kAst, Tok, "invalid syntax", 0, Offset::OneBased);
     return;
   }
   PyObject *Sub = PyList_GET_ITEM(Logicals.get(), 0);
@@ -1950,12 +1951,12 @@ void Checker::fieldExpression(N *Tok, Py_ssize_t Begin, Py_ssize_t End, const Sc
         }
         AtEnd = Depth < 0;
       }
-      reportAt(kAst, At, AtEnd ? "unexpected EOF while parsing" : "invalid syntax");
+      reportAt(kAst, At, AtEnd ? "unexpected EOF while parsing" : "invalid syntax", 0, Offset::OneBased);
       return;
     }
     if (PyErr_ExceptionMatches(PyExc_SyntaxError)) {
       PyErr_Clear();
-      reportAt(kAst, 0, "invalid syntax");
+      reportAt(kAst, 0, "invalid syntax", 0, Offset::OneBased);
       return;
     }
     throw tl::PyErrSet();
@@ -1974,7 +1975,7 @@ void Checker::fieldExpression(N *Tok, Py_ssize_t Begin, Py_ssize_t End, const Sc
     else if (strcmp(XT, ")") == 0 || strcmp(XT, "]") == 0 || strcmp(XT, "}") == 0)
       --Depth;
     else if (Depth == 0 && isStatementOperatorText(XT)) {
-      reportAt(kAst, K, "invalid syntax");
+      reportAt(kAst, K, "invalid syntax", 0, Offset::OneBased);
       return;
     }
   }
@@ -2014,7 +2015,8 @@ void Checker::raise() {
     else if (EndLine)
       OffsetObj = tl::require(PyInt_FromLong(-1));
     else if (Py3)
-      OffsetObj = tl::require(PyInt_FromLong(F.How == Offset::LineStart ? (Py38 ? 1 : 0)
+      OffsetObj = tl::require(PyInt_FromLong(F.How == Offset::OneBased ? Col + 1
+                                          : F.How == Offset::LineStart ? (Py38 ? 1 : 0)
                                           : F.How == Offset::ZeroBased || !Py38 ? Col
                                                                               : Col + 1));
     Ref Error = tl::require(PyObject_CallFunction(PyExc_SyntaxError, const_cast<char *>("(O(slOO))"), Msg.get(),
