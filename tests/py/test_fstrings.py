@@ -66,6 +66,7 @@ class PartListTest(unittest.TestCase):
             (b"f'\\N{DASH}{x}'", [(S, b'\\N{DASH}', 2), (E, b'x', 11)]),
             (b"rf'\\N{x}'", [(S, b'\\N', 3), (E, b'x', 6)]),
             (b"f'\\\\N{x}'", [(S, b'\\\\N', 2), (E, b'x', 6)]),
+            (b"f'{a:\\N{DASH}>{w}}'", [(E, b'a', 3), (F, b'\\N{DASH}>', 5), (E, b'w', 15)]),
             # Unbalanced fields end with the token; what is not a literal gives nothing.
             (b"f'{a)}b'", [(E, b'a)}b', 3)]),
             (b"f'{x'", [(E, b'x', 3)]),
@@ -245,6 +246,62 @@ class InspectionTest(unittest.TestCase):
             counts.append((len(gc.get_objects()), sys.getrefcount(token)))
         self.assertLessEqual(counts[-1][0], counts[1][0] + 20)
         self.assertEqual(counts[-1][1], counts[1][1])
+
+
+# Sources judged by CPython 3.6, 3.7 and 3.8: the fields' own errors, placed at
+# the string, and the checks after parsing run on the fields' expressions in
+# the scope around them.
+kFieldCases = [
+    'x = f"{a"', 'x = f"{a:{b}"', 'x = f"}"', 'x = f"{a}}"', 'x = f"{}"', 'x = f"{ }"', 'x = f"{!r}"', 'x = f"{:}"',
+    'x = f"{a!x}"', 'x = f"{a!}"', 'x = f"{a!rr}"', 'x = f"{#}"', 'x = f"{a:{#}}"', "x = f'{\"\\n\"}'",
+    'x = rf"{a\\b}"', 'x = f"{a:{b:{c}}}"', 'x = f"{a:{b!r:{c}}}"', 'x = f"{a:{b}}}"', 'x = f"{{a}"',
+    'x = f"{\'a}"', 'x = f"{a(b}"', 'x = f"{a[}"', 'x = f"{a)}"', 'x = f"{a[)]}"', 'x = f"{a=b}"', 'x = f"{a=!x}"',
+    'x = f"{*a}"', 'x = f"{a:{*b}}"', 'x = f"{yield}"', 'x = f"{f(a=1, b)}"', 'x = f"{ *a}"',
+    'x = 1 + f"{a!x}" + f"{"', 'x = (1,\n  f"{a!x}")', "x = f'''\n{a!x}'''",
+    "x = f'{a!x}' b''", "x = b'' f'{a!x}'", "x = f'{*a}' + f'{a!x}'", """x = f'{f"{a!x}"}'""",
+    'def f():\n    x = f"{yield}"', 'def f():\n    x = f"{await x}"', 'async def f():\n    x = f"{await x}"',
+    'x = [f"{(y := 1)}" for y in z]', 'class C: [f"{(y := 1)}" for x in z]',
+    # Parse errors: placed in the line, where CPython counts in the parenthesized expression.
+    'x = f"{a b}"', 'x = f"{lambda x: 1}"', 'x = f"{a}" f"{b +}"', 'x = f"{(x := 1)}"',
+    # Valid fields.
+    'x = f"{a=}"', 'x = f"{a = !r:>10}"', 'x = f"{{}} {a:{{}}}"', 'x = f"{a!r:{b!r}}"', 'x = f"{a!r:{b}!x}"',
+    'x = f"{a for a in b}"', 'x = f"{a!=b} {a<b} {a>=b} {a==b}"', "x = f'{\"#\"} {\"a\" \"b\"}'", 'x = f"{*a, b}"',
+    'x = f"\\N{EM DASH} {a:\\N{EM DASH}}"', 'x = f"\\{a}"',
+]
+kParseErrors = ('invalid syntax', 'unexpected EOF while parsing')
+
+
+class FieldChecksTest(unittest.TestCase):
+
+    def testAgainstCPython(self):
+        from pysource import analysis
+        from tests.py import mutants
+        for version in ('3.6', '3.7', '3.8'):
+            sources = [c.encode('utf-8') + b'\n' for c in kFieldCases]
+            theirs = mutants.Verdicts(version, sources) if version in analysis.kVersions else None
+            if theirs is None:
+                continue
+            wrong = []
+            for case, source, want in zip(kFieldCases, sources, theirs):
+                got = mutants.Ours(version, source)
+                if got and want and want[0] in kParseErrors:
+                    got, want = got[0], want[0]
+                if got != want:
+                    wrong.append((version, source, want, got))
+            self.assertEqual(wrong, [])
+            # Without the checks only the grammar's verdict on the fields' text is left.
+            self.assertIsNone(mutants.Ours(version, b'x = f"{a!x} {*b}"\n', checks=False))
+
+    def testNoLeaks(self):
+        from pysource import analysis
+        sources = [c.encode('utf-8') + b'\n' for c in kFieldCases] * 3
+        counts = []
+        for _ in range(8):
+            for source in sources:
+                analysis.AnalyzeText(source, '3.8')
+            gc.collect()
+            counts.append(len(gc.get_objects()))
+        self.assertLessEqual(counts[-1], counts[1])
 
 
 if __name__ == '__main__':
