@@ -1893,11 +1893,11 @@ struct TreeHold {
 void Checker::fieldExpression(N *Tok, Py_ssize_t Begin, Py_ssize_t End, const Scope &S) {
   const char *T = PyString_AS_STRING(Tok->Text);
   std::string Text = "(" + std::string(T + Begin, static_cast<std::size_t>(End - Begin)) + ")";
-  // Where the "(" goes: on the field's '{'.
+  // The "(" stands on the field's '{': from the token's position, over the
+  // lines of the token before it.
   Py_ssize_t TokI = tokenIndex(Tok);
   Frame F{nullptr, Cur, 0, 0};
   {
-    // Positions of this frame's parent record: the token's own, then lines within it.
     host::LogicalLineObject *R = Cur->L;
     Py_ssize_t Count = R->TokenCount;
     Py_ssize_t I = TokI < Count ? TokI : Count - 1;
