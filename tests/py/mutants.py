@@ -52,9 +52,42 @@ def Statements(version, files):
     return found
 
 
+# F-string damage: edits inside the literal of an f-string token.
+kFStringPool = (b'{', b'}', b'{}', b'!x', b'!', b'!r', b'#', b'\\', b':', b':{a:{b}}', b'{a', b'a}', b' ', b'=',
+                b'*', b'(', b')', b'[', b'yield', b'await x', b'"', b"'", b'{{', b'}}')
+
+
+def IsFString(tok):
+    prefix = tok[:len(tok) - len(tok.lstrip(b'fFrR'))]
+    return len(prefix) <= 2 and b'f' in prefix.lower() and tok[len(prefix):len(prefix) + 1] in (b'"', b"'")
+
+
+def MutateFString(tok, rnd):
+    """tok with a byte range inside its quotes dropped, doubled or replaced from the pool."""
+    start = len(tok) - len(tok.lstrip(b'fFrRbBuU'))
+    quote = 3 if tok[start:start + 3] in (b'"""', b"'''") else 1
+    lo, hi = start + quote, len(tok) - quote
+    if hi <= lo:
+        return tok
+    i = rnd.randrange(lo, hi + 1)
+    j = min(hi, i + rnd.choice((0, 1, 1, 2)))
+    op = rnd.randrange(3)
+    if op == 0:
+        return tok[:i] + tok[j:]
+    if op == 1:
+        return tok[:i] + tok[i:j] + tok[i:j] + tok[j:]
+    return tok[:i] + rnd.choice(kFStringPool) + tok[j:]
+
+
 def Mutate(toks, rnd):
-    """A copy of toks with one or two random edits."""
+    """A copy of toks with one or two random edits; a line with an f-string
+    gets one of them inside an f-string half of the time."""
     toks = list(toks)
+    fstrings = [i for i, t in enumerate(toks) if IsFString(t)]
+    if fstrings and rnd.random() < 0.5:
+        i = rnd.choice(fstrings)
+        toks[i] = MutateFString(toks[i], rnd)
+        return toks
     for _ in range(rnd.choice((1, 1, 2))):
         op = rnd.randrange(4)
         i = rnd.randrange(len(toks) + (op == 1))
@@ -91,9 +124,11 @@ def Sources(version, count, seed=4321, files=None):
     damage = random.Random(seed + 1)
     statements = Statements(version, files if files is not None else support.CorpusFiles(version, 400, seed))
     contexts = sorted(k for k in kContexts if version != '2.7' or k != 'async')
+    # Lines with f-strings are rare: they are drawn for a tenth of the mutants.
+    fstrings = [t for t in statements if any(IsFString(x) for x in t)]
     seen, out = set(), []
     while len(out) < count and statements:
-        toks = Mutate(rnd.choice(statements), rnd)
+        toks = Mutate(rnd.choice(fstrings if fstrings and rnd.random() < 0.1 else statements), rnd)
         if not toks or toks[0].startswith(kContinuations):
             continue
         line = b' '.join(toks)

@@ -66,6 +66,7 @@ class PartListTest(unittest.TestCase):
             (b"f'\\N{DASH}{x}'", [(S, b'\\N{DASH}', 2), (E, b'x', 11)]),
             (b"rf'\\N{x}'", [(S, b'\\N', 3), (E, b'x', 6)]),
             (b"f'\\\\N{x}'", [(S, b'\\\\N', 2), (E, b'x', 6)]),
+            (b"f'{a:\\N{DASH}>{w}}'", [(E, b'a', 3), (F, b'\\N{DASH}>', 5), (E, b'w', 15)]),
             # Unbalanced fields end with the token; what is not a literal gives nothing.
             (b"f'{a)}b'", [(E, b'a)}b', 3)]),
             (b"f'{x'", [(E, b'x', 3)]),
@@ -160,13 +161,14 @@ class PartListTest(unittest.TestCase):
 class InspectionTest(unittest.TestCase):
 
     def testErrorsAreLocatedInTheOuterLine(self):
+        kEnd = 'unexpected EOF while parsing'
         cases = [
             (b"x = f'{a b}'\n", 1, 10),
             (b"x = rf'{a b}'\n", 1, 11),
             (b"x = (1,\n    f'{a b}')\n", 2, 10),
             (b"x = f'''\n  {a b}'''\n", 2, 6),
             (b"x = f'''{\na b}'''\n", 2, 3),
-            (b"x = f'{a}' f'{b +}'\n", 1, 18),
+            (b"x = f'{a}' f'{b +}'\n", 1, 18, kEnd),  # at the end of the field's parentheses
             (b"""x = f'{f"{a b}"}'\n""", 1, 13),
             (b"x = f'{a)}b'\n", 1, 9),
             # The grammar parses a field as a whole line; statements are errors there.
@@ -175,11 +177,12 @@ class InspectionTest(unittest.TestCase):
             (b"x = f'{del y}'\n", 1, 8),
             (b"x = f'{a; b}'\n", 1, 9),
         ]
-        for source, line, column in cases:
+        for case in cases:
+            source, line, column = case[:3]
             logical, result = Analyze(source)
             self.assertIsInstance(result, SyntaxError, source)
             self.assertEqual((result.msg, result.filename, result.lineno, result.offset),
-                             ('invalid syntax', '<string>', line, column), source)
+                             (case[3] if len(case) > 3 else 'invalid syntax', '<string>', line, column), source)
             self.assertEqual(result.text, logicalinspect.TextFromTokens(logical))
             self.assertEqual((logical.fNamesDefined, logical.fTypeEquivs), ([], []), source)
         analyzer = tl.CPGenAnalyzerImpl((3, 6, 0))
@@ -192,8 +195,13 @@ class InspectionTest(unittest.TestCase):
     def testValidLines(self):
         for source in [b"f'{x!r:>{width}} {a != b} { {1: 2}[1] } {(lambda y=1: y)()}'\n",
                        b"""f'{d["]"]} {s.split("(")} {f"{g}"} {x:%H:%M}'\n""",
-                       b"f'''{3+\n4} \\N{DASH}'''\n", b"rf'{x}' 'a{b c}' b'{b c}'\n"]:
+                       b"f'''{3+\n4} \\N{DASH}'''\n", b"rf'{x}' 'a{b c}' b'{b c}'\n",
+                       b"f'{a for a in b}'\n"]:  # read in parentheses, as the language reads a field
             self.assertIsNone(Analyze(source)[1], source)
+        # 3.6 reads a field without the keywords of the async def around it; 3.7 has them everywhere.
+        source = b"x = f'{await y}'\n"
+        self.assertIsInstance(tl.CPGenAnalyzerImpl((3, 6, 0)).AnalyzeSingleLogical(First(source), True), SyntaxError)
+        self.assertIsNone(tl.CPGenAnalyzerImpl((3, 7, 0)).AnalyzeSingleLogical(First(source), True))
 
     def testFindingsAreCopied(self):
         class Planted(tl.CFStringSupport):
@@ -238,6 +246,62 @@ class InspectionTest(unittest.TestCase):
             counts.append((len(gc.get_objects()), sys.getrefcount(token)))
         self.assertLessEqual(counts[-1][0], counts[1][0] + 20)
         self.assertEqual(counts[-1][1], counts[1][1])
+
+
+# Sources judged by CPython 3.6, 3.7 and 3.8: the fields' own errors, placed at
+# the string, and the checks after parsing run on the fields' expressions in
+# the scope around them.
+kFieldCases = [
+    'x = f"{a"', 'x = f"{a:{b}"', 'x = f"}"', 'x = f"{a}}"', 'x = f"{}"', 'x = f"{ }"', 'x = f"{!r}"', 'x = f"{:}"',
+    'x = f"{a!x}"', 'x = f"{a!}"', 'x = f"{a!rr}"', 'x = f"{#}"', 'x = f"{a:{#}}"', "x = f'{\"\\n\"}'",
+    'x = rf"{a\\b}"', 'x = f"{a:{b:{c}}}"', 'x = f"{a:{b!r:{c}}}"', 'x = f"{a:{b}}}"', 'x = f"{{a}"',
+    'x = f"{\'a}"', 'x = f"{a(b}"', 'x = f"{a[}"', 'x = f"{a)}"', 'x = f"{a[)]}"', 'x = f"{a=b}"', 'x = f"{a=!x}"',
+    'x = f"{*a}"', 'x = f"{a:{*b}}"', 'x = f"{yield}"', 'x = f"{f(a=1, b)}"', 'x = f"{ *a}"',
+    'x = 1 + f"{a!x}" + f"{"', 'x = (1,\n  f"{a!x}")', "x = f'''\n{a!x}'''",
+    "x = f'{a!x}' b''", "x = b'' f'{a!x}'", "x = f'{*a}' + f'{a!x}'", """x = f'{f"{a!x}"}'""",
+    'def f():\n    x = f"{yield}"', 'def f():\n    x = f"{await x}"', 'async def f():\n    x = f"{await x}"',
+    'x = [f"{(y := 1)}" for y in z]', 'class C: [f"{(y := 1)}" for x in z]',
+    # Parse errors: placed in the line, where CPython counts in the parenthesized expression.
+    'x = f"{a b}"', 'x = f"{lambda x: 1}"', 'x = f"{a}" f"{b +}"', 'x = f"{(x := 1)}"',
+    # Valid fields.
+    'x = f"{a=}"', 'x = f"{a = !r:>10}"', 'x = f"{{}} {a:{{}}}"', 'x = f"{a!r:{b!r}}"', 'x = f"{a!r:{b}!x}"',
+    'x = f"{a for a in b}"', 'x = f"{a!=b} {a<b} {a>=b} {a==b}"', "x = f'{\"#\"} {\"a\" \"b\"}'", 'x = f"{*a, b}"',
+    'x = f"\\N{EM DASH} {a:\\N{EM DASH}}"', 'x = f"\\{a}"',
+]
+kParseErrors = ('invalid syntax', 'unexpected EOF while parsing')
+
+
+class FieldChecksTest(unittest.TestCase):
+
+    def testAgainstCPython(self):
+        from pysource import analysis
+        from tests.py import mutants
+        for version in ('3.6', '3.7', '3.8'):
+            sources = [c.encode('utf-8') + b'\n' for c in kFieldCases]
+            theirs = mutants.Verdicts(version, sources) if version in analysis.kVersions else None
+            if theirs is None:
+                continue
+            wrong = []
+            for case, source, want in zip(kFieldCases, sources, theirs):
+                got = mutants.Ours(version, source)
+                if got and want and want[0] in kParseErrors:
+                    got, want = got[0], want[0]
+                if got != want:
+                    wrong.append((version, source, want, got))
+            self.assertEqual(wrong, [])
+            # Without the checks only the grammar's verdict on the fields' text is left.
+            self.assertIsNone(mutants.Ours(version, b'x = f"{a!x} {*b}"\n', checks=False))
+
+    def testNoLeaks(self):
+        from pysource import analysis
+        sources = [c.encode('utf-8') + b'\n' for c in kFieldCases] * 3
+        counts = []
+        for _ in range(8):
+            for source in sources:
+                analysis.AnalyzeText(source, '3.8')
+            gc.collect()
+            counts.append(len(gc.get_objects()))
+        self.assertLessEqual(counts[-1], counts[1])
 
 
 if __name__ == '__main__':

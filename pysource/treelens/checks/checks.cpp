@@ -4,6 +4,7 @@
 // the earliest pass; each pass here keeps its first error in tree order.
 #include "pysource/treelens/checks/checks.h"
 
+#include "pysource/treelens/checks/fstrings.h"
 #include "pysource/treelens/host/host.h"
 #include "pysource/treelens/nodes/node.h"
 
@@ -329,6 +330,8 @@ enum class Offset : uint8_t {
   Node,      ///< the node's column: 0-based before 3.8, 1-based from 3.8 on (none in 2.7)
   LineStart, ///< 0 whatever the node
   ZeroBased, ///< the node's 0-based column in every version
+  FString,   ///< as Node; before 3.8 a string over several lines gives its last line and offset -1
+  OneBased,  ///< the 1-based column, as the parser gives it
 };
 
 struct Found {
@@ -337,12 +340,24 @@ struct Found {
   Py_ssize_t TokI = 0;
   int ColDelta = 0;  ///< added to the column of the token (the parser's errors point past a token)
   Offset How = Offset::Node;
+  bool Placed = false; ///< in an f-string's expression: Row and Col place it in the line
+  long Row = 0, Col = 0;
+};
+
+/// The record whose tokens the tree being checked holds: the line's own, or
+/// that of an f-string expression, "(" text ")", placed in its parent's
+/// coordinates with its "(" at (Row, Col).
+struct Frame {
+  host::LogicalLineObject *L;
+  const Frame *Parent;
+  long Row, Col;
 };
 
 class Checker {
 public:
   Checker(ParserObject *P, PyObject *Logical)
-      : Logical(Logical), L(reinterpret_cast<host::LogicalLineObject *>(Logical)) {
+      : Parser(P), Logical(Logical), L(reinterpret_cast<host::LogicalLineObject *>(Logical)), Top{L, nullptr, 0, 0},
+        Cur(&Top) {
     Py3 = P->Py3Grammar;
     Minor = 0;
     if (P->VersionTriple && PyTuple_Check(P->VersionTriple) && PyTuple_GET_SIZE(P->VersionTriple) >= 2) {
@@ -358,8 +373,11 @@ public:
   void run(N *Tree);
 
 private:
+  ParserObject *Parser;
   PyObject *Logical;
   host::LogicalLineObject *L;
+  Frame Top;
+  const Frame *Cur; ///< the record of the tree being checked
   bool Py3;
   bool Py38 = false; ///< 3.8's messages and 1-based offsets
   int Depth = 0;
@@ -369,15 +387,20 @@ private:
   void report(Pass P, N *At, std::string Msg, int ColDelta = 0, Offset How = Offset::Node) {
     if (First[P].Set)
       return;
-    First[P].Set = true;
-    First[P].Msg = std::move(Msg);
-    N *Leaf = firstLeaf(At);
-    long I = Leaf->Context && PyInt_Check(Leaf->Context) ? PyInt_AS_LONG(Leaf->Context) : 0;
-    First[P].TokI = I;
-    First[P].ColDelta = ColDelta;
-    First[P].How = How;
+    reportAt(P, tokenIndex(At), std::move(Msg), ColDelta, How);
   }
+  static Py_ssize_t tokenIndex(N *At) {
+    N *Leaf = firstLeaf(At);
+    return Leaf->Context && PyInt_Check(Leaf->Context) ? PyInt_AS_LONG(Leaf->Context) : 0;
+  }
+  void reportAt(Pass P, Py_ssize_t TokI, std::string Msg, int ColDelta = 0, Offset How = Offset::Node);
   void raise();
+
+  // F-strings.
+  void strings(N *X, const Scope &S);
+  bool fstring(N *Tok, N *Atom, const Scope &S);
+  void fieldExpression(N *Tok, Py_ssize_t Begin, Py_ssize_t End, const Scope &S);
+  void place(const Frame *F, Py_ssize_t TokI, long &Row, long &Col) const;
 
   // Statements.
   void stmt(N *X, const Scope &S);
@@ -904,7 +927,9 @@ void Checker::load(N *X, const Scope &S) {
   if (Depth > kMaxDepth)
     return;
   if (isLeaf(X)) {
-    if (textIs(X, "yield"))
+    if (Py3 && Minor >= 6 && symOf(X) == Sym::String && isFString(X))
+      fstring(X, X, S);
+    else if (textIs(X, "yield"))
       yieldExpr(X, S);
     else if (Py3 && textIs(X, "<>"))
       report(kParse, X, "invalid syntax", 1);
@@ -950,6 +975,8 @@ void Checker::elements(N *X, const Scope &S, bool StarOk) {
 void Checker::starred(N *X, const Scope &) { report(kCompile, X, "can't use starred expression here"); }
 
 void Checker::atom(N *X, const Scope &S) {
+  if (symOf(child(X, 0)) == Sym::String && Py3 && Minor >= 6)
+    return strings(X, S);
   if (symOf(child(X, 0)) == Sym::String) {
     // Adjacent literals join into one: Python 3 cannot join bytes and text.
     int Bytes = 0;
@@ -1748,6 +1775,213 @@ void Checker::parameters(N *X, const Scope &S, std::vector<std::string> &Names, 
   }
 }
 
+// ---- f-strings ----
+
+void Checker::reportAt(Pass P, Py_ssize_t TokI, std::string Msg, int ColDelta, Offset How) {
+  if (First[P].Set)
+    return;
+  Found &F = First[P];
+  F.Set = true;
+  F.Msg = std::move(Msg);
+  F.TokI = TokI;
+  F.ColDelta = ColDelta;
+  F.How = How;
+  if (Cur != &Top) {
+    F.Placed = true;
+    place(Cur, TokI, F.Row, F.Col);
+  }
+}
+
+/// The line's (row, column) of token TokI of frame F's record (past its last
+/// token for an index beyond it).
+void Checker::place(const Frame *F, Py_ssize_t TokI, long &Row, long &Col) const {
+  host::LogicalLineObject *R = F->L;
+  Py_ssize_t Count = R->TokenCount;
+  Row = Col = 0;
+  if (Count > 0) {
+    Py_ssize_t I = TokI < 0 ? 0 : TokI < Count ? TokI : Count - 1;
+    Row = R->Positions[I].Row;
+    Col = R->Positions[I].Col;
+    PyObject *T = R->Texts[I];
+    if (TokI >= Count && T && PyString_Check(T))
+      Col += static_cast<long>(PyString_GET_SIZE(T));
+  }
+  for (; F->Parent; F = F->Parent) {
+    if (Row == 0)
+      Col += F->Col;
+    Row += F->Row;
+  }
+}
+
+/// Adjacent string literals, joined in order: a bytes literal beside a text
+/// one stops the join, and each f-string is read as CPython reads it.
+void Checker::strings(N *X, const Scope &S) {
+  bool Bytes = prefixHas(child(X, 0), 'b');
+  for (Py_ssize_t I = 0; I < count(X); ++I) {
+    N *T = child(X, I);
+    if (prefixHas(T, 'b') != Bytes) {
+      report(kAst, X, "cannot mix bytes and nonbytes literals");
+      return;
+    }
+    if (isFString(T) && !fstring(T, X, S))
+      return;
+  }
+}
+
+/// One f-string token of the atom At: its fields' expressions are checked in
+/// order in the enclosing scope, then the scan's own error, which CPython
+/// reports at the atom. False when an error ends the join.
+bool Checker::fstring(N *Tok, N *At, const Scope &S) {
+  if (!Tok->Text || !PyString_Check(Tok->Text))
+    return true;
+  FieldScan Scan;
+  scanFString(PyString_AS_STRING(Tok->Text), PyString_GET_SIZE(Tok->Text), Py38, Scan);
+  std::size_t Checked = Scan.Failed ? Scan.ErrorAfter : Scan.Exprs.size();
+  for (std::size_t I = 0; I < Checked && !First[kParse].Set && !First[kAst].Set; ++I)
+    fieldExpression(Tok, Scan.Exprs[I].Begin, Scan.Exprs[I].End, S);
+  if (First[kParse].Set || First[kAst].Set)
+    return false;
+  if (Scan.Failed && !Scan.Error.empty())
+    report(kAst, At, Scan.Error, 0, Offset::FString);
+  return !Scan.Failed;
+}
+
+/// The token index of a ParseError pending (cleared).
+Py_ssize_t takeParseErrorContext() {
+  PyObject *Type, *Value, *Tb;
+  PyErr_Fetch(&Type, &Value, &Tb);
+  PyErr_NormalizeException(&Type, &Value, &Tb);
+  Ref HoldType = Ref::steal(Type), HoldValue = Ref::steal(Value), HoldTb = Ref::steal(Tb);
+  Ref Context = tl::require(PyObject_GetAttrString(Value ? Value : Py_None, "context"));
+  Py_ssize_t TokI = PyNumber_AsSsize_t(Context.get(), PyExc_OverflowError);
+  if (TokI == -1 && PyErr_Occurred())
+    throw tl::PyErrSet();
+  return TokI;
+}
+
+/// An assignment, annotation or statement separator outside brackets: the
+/// expression's text closed the parenthesis around it early.
+bool isStatementOperatorText(const char *T) {
+  static const char *const Ops[] = {"=",  ":",  ";",  "+=",  "-=",  "*=",  "/=",  "%=", "&=",
+                                    "|=", "^=", "<<=", ">>=", "**=", "//=", "@="};
+  for (const char *O : Ops)
+    if (strcmp(T, O) == 0)
+      return true;
+  return false;
+}
+
+/// Returns a field's tree to the parser's free lists.
+struct TreeHold {
+  ParserObject *P;
+  Ref Tree;
+  ~TreeHold() {
+    if (Tree && Tree.get() != Py_None && isNode(Tree.get())) {
+      PyObject *Type, *Value, *Tb;
+      PyErr_Fetch(&Type, &Value, &Tb);
+      if (!tl::guard<bool>(false, [&] {
+            discardNode(P, Tree.get());
+            return true;
+          }))
+        PyErr_WriteUnraisable(Tree.get());
+      PyErr_Restore(Type, Value, Tb);
+    }
+  }
+};
+
+/// The expression Tok[Begin:End] of a field, parsed as CPython parses it,
+/// "(" text ")", and checked in the scope S of the f-string.
+void Checker::fieldExpression(N *Tok, Py_ssize_t Begin, Py_ssize_t End, const Scope &S) {
+  const char *T = PyString_AS_STRING(Tok->Text);
+  std::string Text = "(" + std::string(T + Begin, static_cast<std::size_t>(End - Begin)) + ")";
+  // The "(" stands on the field's '{': from the token's position, over the
+  // lines of the token before it.
+  Py_ssize_t TokI = tokenIndex(Tok);
+  Frame F{nullptr, Cur, 0, 0};
+  {
+    host::LogicalLineObject *R = Cur->L;
+    Py_ssize_t Count = R->TokenCount;
+    Py_ssize_t I = TokI < Count ? TokI : Count - 1;
+    if (I < 0)
+      return;
+    F.Row = R->Positions[I].Row;
+    F.Col = R->Positions[I].Col;
+    for (Py_ssize_t K = 0; K < Begin - 1; ++K) {
+      if (T[K] == '\n' || (T[K] == '\r' && T[K + 1] != '\n')) {
+        ++F.Row;
+        F.Col = -(K + 1);
+      }
+    }
+    F.Col += Begin - 1;
+  }
+  Ref Logicals = tl::require(host::Host.Fast->SplitLogicals(Text.data(), static_cast<Py_ssize_t>(Text.size())));
+  if (!PyList_Check(Logicals.get()) || PyList_GET_SIZE(Logicals.get()) != 1 ||
+      !host::isLogical(PyList_GET_ITEM(Logicals.get(), 0))) {
+    // The text ends the parenthesis and goes on over another line.
+    report(kAst, Tok, "invalid syntax", 0, Offset::OneBased);
+    return;
+  }
+  PyObject *Sub = PyList_GET_ITEM(Logicals.get(), 0);
+  F.L = reinterpret_cast<host::LogicalLineObject *>(Sub);
+  struct Enter {
+    const Frame *&Cur, *Saved;
+    Enter(const Frame *&C, const Frame *F) : Cur(C), Saved(C) { Cur = F; }
+    ~Enter() { Cur = Saved; }
+  } InField(Cur, &F);
+  Py_ssize_t Count = F.L->TokenCount;
+  TreeHold Hold{Parser, Ref()};
+  // 3.6 reads the expression without the enclosing async def's keywords.
+  bool Ok = tl::guard<bool>(false, [&] {
+    Hold.Tree = parseToNode(Parser, Sub, false);
+    return true;
+  });
+  if (!Ok) {
+    if (PyErr_ExceptionMatches(host::Host.ParseError)) {
+      Py_ssize_t At = takeParseErrorContext();
+      // The closing parenthesis is the last token: CPython's tokenizer has
+      // then read to the end, and calls the error an unexpected end.
+      bool AtEnd = At >= Count - 1;
+      if (!AtEnd && !Py38 && At >= 0 && At < Count && F.L->Texts[At] && PyString_Check(F.L->Texts[At]) &&
+          strcmp(PyString_AS_STRING(F.L->Texts[At]), ")") == 0) {
+        // An unmatched ')' closes the added parenthesis; the error is then at the last one.
+        int Depth = 0;
+        for (Py_ssize_t K = 0; K <= At; ++K) {
+          const char *X = F.L->Texts[K] && PyString_Check(F.L->Texts[K]) ? PyString_AS_STRING(F.L->Texts[K]) : "";
+          Depth += (strcmp(X, "(") == 0 || strcmp(X, "[") == 0 || strcmp(X, "{") == 0) ? 1
+                   : (strcmp(X, ")") == 0 || strcmp(X, "]") == 0 || strcmp(X, "}") == 0) ? -1 : 0;
+        }
+        AtEnd = Depth < 0;
+      }
+      reportAt(kAst, At, AtEnd ? "unexpected EOF while parsing" : "invalid syntax", 0, Offset::OneBased);
+      return;
+    }
+    if (PyErr_ExceptionMatches(PyExc_SyntaxError)) {
+      PyErr_Clear();
+      reportAt(kAst, 0, "invalid syntax", 0, Offset::OneBased);
+      return;
+    }
+    throw tl::PyErrSet();
+  }
+  if (!Hold.Tree || !isNode(Hold.Tree.get()))
+    return;
+  // Past the added parenthesis only expression tokens may follow.
+  int Depth = 0;
+  for (Py_ssize_t K = 0; K < Count; ++K) {
+    PyObject *X = F.L->Texts[K];
+    if (!X || !PyString_Check(X))
+      continue;
+    const char *XT = PyString_AS_STRING(X);
+    if (strcmp(XT, "(") == 0 || strcmp(XT, "[") == 0 || strcmp(XT, "{") == 0)
+      ++Depth;
+    else if (strcmp(XT, ")") == 0 || strcmp(XT, "]") == 0 || strcmp(XT, "}") == 0)
+      --Depth;
+    else if (Depth == 0 && isStatementOperatorText(XT)) {
+      reportAt(kAst, K, "invalid syntax", 0, Offset::OneBased);
+      return;
+    }
+  }
+  stmt(reinterpret_cast<N *>(Hold.Tree.get()), S);
+}
+
 // ---- the error ----
 
 void Checker::raise() {
@@ -1757,8 +1991,18 @@ void Checker::raise() {
       continue;
     Py_ssize_t Count = L->TokenCount;
     Py_ssize_t I = F.TokI < Count ? F.TokI : Count - 1;
-    long Row = I >= 0 ? L->Positions[I].Row : 0;
-    long Col = I >= 0 ? L->Positions[I].Col : 0;
+    long Row = F.Placed ? F.Row : I >= 0 ? L->Positions[I].Row : 0;
+    long Col = F.Placed ? F.Col : I >= 0 ? L->Positions[I].Col : 0;
+    bool EndLine = false;
+    if (F.How == Offset::FString && !Py38 && !F.Placed && I >= 0 && L->Texts[I] && PyString_Check(L->Texts[I])) {
+      // Before 3.8 a string token over several lines is placed on its last line, at no column.
+      const char *T = PyString_AS_STRING(L->Texts[I]);
+      for (Py_ssize_t K = 0; K < PyString_GET_SIZE(L->Texts[I]); ++K)
+        if (T[K] == '\n' || (T[K] == '\r' && T[K + 1] != '\n')) {
+          ++Row;
+          EndLine = true;
+        }
+    }
     Ref Text = tl::require(PyObject_CallMethod(host::Host.LogicalInspect, const_cast<char *>("TextFromTokens"),
                                                const_cast<char *>("(O)"), Logical));
     Ref Msg = tl::require(PyString_FromStringAndSize(F.Msg.data(), static_cast<Py_ssize_t>(F.Msg.size())));
@@ -1768,8 +2012,11 @@ void Checker::raise() {
     long Column = Col + 1 + F.ColDelta;
     if (P == kParse)
       OffsetObj = tl::require(PyInt_FromLong(Col + 1 + F.ColDelta));
+    else if (EndLine)
+      OffsetObj = tl::require(PyInt_FromLong(-1));
     else if (Py3)
-      OffsetObj = tl::require(PyInt_FromLong(F.How == Offset::LineStart ? (Py38 ? 1 : 0)
+      OffsetObj = tl::require(PyInt_FromLong(F.How == Offset::OneBased ? Col + 1
+                                          : F.How == Offset::LineStart ? (Py38 ? 1 : 0)
                                           : F.How == Offset::ZeroBased || !Py38 ? Col
                                                                               : Col + 1));
     Ref Error = tl::require(PyObject_CallFunction(PyExc_SyntaxError, const_cast<char *>("(O(slOO))"), Msg.get(),

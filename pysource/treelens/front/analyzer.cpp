@@ -379,7 +379,7 @@ void inspectSingleLogical(AnalyzerObject *A, PyObject *Logical, bool InAsyncDef,
       return;
   }
   bool Ok = tl::guard<bool>(false, [&] {
-    // An f-string's expression stands alone here, out of its line and scope.
+    // An f-string's expression stands alone here: the checks of its line cover it, in its scope.
     if (A->SyntaxChecks && !InFString)
       checks::checkLine(A->LogicalParser, Tree.get(), Logical, InAsyncDef);
     walker::walk(A->NodeWalker, Tree.get(), Logical);

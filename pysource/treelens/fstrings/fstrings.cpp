@@ -334,7 +334,11 @@ void cutParts(PyObject *Self, const char *Tok, Py_ssize_t N, bool ExpOnly, std::
         Kind = kStringPart;
       break;
     case kFormatPart:
-      if (Frag.is('{')) {
+      if (InNamedEscape) {
+        InNamedEscape = !Frag.is('}');
+      } else if (Frag.is('{') && !Raw && I > 0 && endsWithNamedEscape(Items[I - 1].Text)) {
+        InNamedEscape = true; // a format specification names characters too
+      } else if (Frag.is('{')) {
         Kind = kExpressionPart; // a replacement field nested in the format specification
         InFormat = true;
       } else if (Frag.is('}')) {

@@ -7,6 +7,7 @@
 #include "pysource/treelens/host/host.h"
 
 #include <cstring>
+#include <string>
 
 namespace treelens {
 namespace fstrings {
@@ -94,7 +95,7 @@ void errorPosition(LogicalLineObject *L, Py_ssize_t TokI, long &Line, long &Colu
   Column = L->Positions[Count - 1].Col + 1 + (Last && PyString_Check(Last) ? PyString_GET_SIZE(Last) : 0);
 }
 
-/// Clears Logical's derived info and raises "invalid syntax" located, 1-based,
+/// Clears Logical's derived info and raises CPython's parse error located, 1-based,
 /// at token SubTokI of the sub-logical Sub, in the outer line's source.
 [[noreturn]] void raiseLocated(PyObject *Logical, Py_ssize_t TokenI, PyObject *Text, Py_ssize_t PartPos,
                                PyObject *Sub, Py_ssize_t SubTokI) {
@@ -129,10 +130,14 @@ void errorPosition(LogicalLineObject *L, Py_ssize_t TokI, long &Line, long &Colu
     Col = InnerColumn - 1;
   }
 
+  // CPython parses the expression in parentheses: an error at their end is
+  // one past the last token, where its tokenizer has read to the end.
   static PyObject *InvalidSyntax = tl::internName("invalid syntax");
+  static PyObject *UnexpectedEnd = tl::internName("unexpected EOF while parsing");
+  PyObject *Msg = SubTokI >= SubL->TokenCount ? UnexpectedEnd : InvalidSyntax;
   Ref Source = tl::require(PyObject_CallMethod(Host.LogicalInspect, const_cast<char *>("TextFromTokens"),
                                                const_cast<char *>("(O)"), Logical));
-  Ref Error = tl::require(PyObject_CallFunction(PyExc_SyntaxError, const_cast<char *>("(O(sllO))"), InvalidSyntax,
+  Ref Error = tl::require(PyObject_CallFunction(PyExc_SyntaxError, const_cast<char *>("(O(sllO))"), Msg,
                                                 "<string>", Row + 1, Col + 1, Source.get()));
   PyErr_SetObject(PyExc_SyntaxError, Error.get());
   throw tl::PyErrSet();
@@ -246,6 +251,33 @@ Ref withoutSelfDocumentingMarker(LogicalLineObject *Sub) {
                                            static_cast<long>(Sub->FirstLine), LineText));
 }
 
+/// Whether await and async are keywords in any function (3.7 on), so that
+/// an f-string's expression reads them as the enclosing async def does.
+bool hasAsyncKeywords(AnalyzerObject *A) {
+  PyObject *Triple = A->LogicalParser ? A->LogicalParser->VersionTriple : nullptr;
+  if (!Triple)
+    return true;
+  static PyObject *Py37 = Py_BuildValue("(ii)", 3, 7);
+  if (!Py37)
+    throw tl::PyErrSet();
+  return tl::requireStatus(PyObject_RichCompareBool(Triple, Py37, Py_GE)) != 0;
+}
+
+/// The record of Sub's line text in parentheses, or null when that is not one line.
+Ref parenthesized(PyObject *Sub) {
+  if (!host::isLogical(Sub))
+    return Ref();
+  PyObject *LineText = record(Sub)->LineText;
+  if (!LineText || !PyString_Check(LineText))
+    return Ref();
+  std::string Text = "(" + std::string(PyString_AS_STRING(LineText), PyString_GET_SIZE(LineText)) + "\n)";
+  Ref Logicals = tl::require(Host.Fast->SplitLogicals(Text.data(), static_cast<Py_ssize_t>(Text.size())));
+  if (!PyList_Check(Logicals.get()) || PyList_GET_SIZE(Logicals.get()) != 1 ||
+      !host::isLogical(PyList_GET_ITEM(Logicals.get(), 0)))
+    return Ref();
+  return Ref::borrow(PyList_GET_ITEM(Logicals.get(), 0));
+}
+
 /// _InspectSingleFStringToken: analyzes each expression of the token Text (at
 /// index TokenI of Logical) with f-string inspection suppressed and copies
 /// its findings into Logical.
@@ -265,10 +297,34 @@ void inspectSingleFStringToken(AnalyzerObject *A, PyObject *Logical, Py_ssize_t 
       if (At >= 0)
         raiseLocated(Logical, TokenI, Text, It.Pos, Sub, At);
     }
+    // 3.6 reads the expression without the enclosing async def's keywords.
+    bool Async = InAsyncDef && hasAsyncKeywords(A);
     bool Ok = tl::guard<bool>(false, [&] {
-      inspectSingleLogical(A, Sub, InAsyncDef, /*InFString=*/true);
+      inspectSingleLogical(A, Sub, Async, /*InFString=*/true);
       return true;
     });
+    if (!Ok && PyErr_ExceptionMatches(Host.ParseError)) {
+      // An expression that is not a statement on its own, such as a bare
+      // generator expression, parses in the parentheses the language reads
+      // it in.
+      PyObject *Type, *Value, *Tb;
+      PyErr_Fetch(&Type, &Value, &Tb);
+      Ref Wrapped = parenthesized(Sub);
+      if (Wrapped && tl::guard<bool>(false, [&] {
+            inspectSingleLogical(A, Wrapped.get(), Async, /*InFString=*/true);
+            return true;
+          })) {
+        Py_XDECREF(Type);
+        Py_XDECREF(Value);
+        Py_XDECREF(Tb);
+        It.Logical = std::move(Wrapped);
+        Sub = It.Logical.get();
+        Ok = true;
+      } else {
+        PyErr_Clear();
+        PyErr_Restore(Type, Value, Tb);
+      }
+    }
     if (!Ok) {
       if (PyErr_ExceptionMatches(Host.ParseError))
         raiseLocated(Logical, TokenI, Text, It.Pos, Sub, parseErrorContext());
