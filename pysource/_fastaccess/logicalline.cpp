@@ -320,6 +320,10 @@ int set_inspected(PyObject *O, PyObject *V, void *) {
   return 0;
 }
 
+PyObject *get_truncated(PyObject *O, void *) {
+  return PyBool_FromLong(self(O)->Flags & kFlagTruncated);
+}
+
 PyObject *optional(PyObject *V) {
   if (!V)
     V = Py_None;
@@ -451,6 +455,8 @@ PyGetSetDef GetSets[] = {
     TL_GET("fTokenCount", get_token_count, "number of tokens"),
     TL_GET("fKind", get_kind, "0 statement, 1 class, 2 def, 11 try, 21 comment, 22 blank"),
     TL_GETSET("fInspected", get_inspected, set_inspected, "set once the analyzer has seen it"),
+    TL_GET("fTruncated", get_truncated,
+           "whether the analysis stopped at the walker's limits, recording only what came before"),
     TL_GETSET("fParentScope", get_parent_scope, set_parent_scope,
               "the enclosing def/class logical, or None"),
     TL_GETSET("fLocalScopeDefined", get_local_scope, set_local_scope,
@@ -481,6 +487,7 @@ void expectBytes(PyObject *Obj) { tl::expectType(PyString_Check(Obj), msg::Bytes
 int clearDerivedInfo(PyObject *Logical) {
   return guard(-1, [&] {
     LogicalLineObject *L = asLogical(Logical);
+    L->Flags &= ~kFlagTruncated;
     PyObject *Lists[] = {L->NamesDefined, L->TypeEquivs, L->ArgNames, L->ArgTypeEquivs,
                          L->BaseClassNames};
     for (PyObject *List : Lists)
