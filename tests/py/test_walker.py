@@ -334,6 +334,48 @@ class TruncatedTest(unittest.TestCase):
             self.assertNotIn('RuntimeError', err.getvalue())
 
 
+class LinearCostTest(unittest.TestCase):
+    """Long chains record a bounded number of prefixes; one line's checks are linear in its names."""
+
+    def testChainsRecordBoundedPrefixes(self):
+        shapes = [(b'x = a%s\n', b'.a'), (b'x = a%s\n', b'.b()'), (b'x: a%s = 1\n', b'.a'),
+                  (b'@a%s\n', b'.a'), (b'a%s = 1\n', b'[i].b')]
+        for shape, piece in shapes:
+            sizes = []
+            for n in (20, 200, 2000):
+                source = shape % (piece * n)
+                L = support.AnalyzeLine('3.8', source)[1]
+                infos = list(L.fTypeEquivs) + [(n, b'') for n in L.fNamesDefined]
+                sizes.append((len(infos), sum(len(n) + len(i) for n, i in infos) // len(source)))
+            # Entries stop growing past the cap; their bytes stay a bounded multiple of the line.
+            self.assertEqual(sizes[1][0], sizes[2][0], (shape, piece, sizes))
+            self.assertLessEqual(sizes[2][1], 4, (shape, piece, sizes))
+        reads = Record('3.8', b'x = a' + b'.a' * 40 + b'(q)\n')[2]
+        self.assertEqual(len(reads), 34)  # a, a.a ... 32 trailers deep, and the argument q
+        self.assertIn(b'q', reads)
+
+    def testChecksLinearInNames(self):
+        # 200,000 names: comparing every pair takes many minutes; a minute of CPU is generous.
+        script = ('import resource, sys; resource.setrlimit(resource.RLIMIT_CPU, (60, 60)); '
+                  'sys.stdout = open("/dev/null", "w"); '
+                  'from pysource import analysis; n = 200000; '
+                  'kw = b"f(" + b", ".join(b"k%d=1" % i for i in range(n)) + b", k7=2)\\n"; '
+                  'params = b", ".join(b"p%d" % i for i in range(n)); '
+                  'df = b"def f(" + params + b", p5): global " + params + b"\\n"; '
+                  'gl = b"def f(" + params + b"): global " + params + b"\\n"; '
+                  'print >>sys.stderr, [analysis.AnalyzeText(s, "3.8").SyntaxErrors() for s in (kw, df, gl)]')
+        env = dict(os.environ, PYTHONPATH=support.kRoot)
+        if 'TREELENS_BUILD_DIR' in env:
+            env['TREELENS_BUILD_DIR'] = os.path.abspath(env['TREELENS_BUILD_DIR'])
+        proc = subprocess.Popen([sys.executable, '-c', script], stdout=subprocess.PIPE, stderr=subprocess.PIPE,
+                                env=env, cwd=support.kRoot)
+        out, err = proc.communicate()
+        self.assertEqual(proc.returncode, 0, err[-2000:])
+        self.assertIn("keyword argument repeated", err)
+        self.assertIn("duplicate argument 'p5' in function definition", err)
+        self.assertIn("name 'p0' is parameter and global", err)
+
+
 class DeterminismTest(unittest.TestCase):
 
     def testSameUnderEveryHashSeed(self):

@@ -324,7 +324,8 @@ void visitDottedName(NW *W, PyObject *Node) {
   if (!PyList_Check(Children.get()))
     return;
   std::string Text;
-  for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Children.get()); ++I) {
+  // Parts and dots alternate: the prefixes of the first kMaxChainPrefixes + 1 parts are read.
+  for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Children.get()) && I <= 2 * kMaxChainPrefixes; ++I) {
     Ref Child = Ref::borrow(PyList_GET_ITEM(Children.get(), I));
     PyObject *Piece = asAnyNode(Child.get())->Text;
     if (!Piece || !PyString_Check(Piece))
@@ -850,6 +851,16 @@ void visitAtomPlusTrailers(NW *W, PyObject *Atom, PyObject *AllTrailers) {
     NodeObject *T = asNodeOf(Trailer.get(), C::CTrailer);
     Ref Tok = trailerGetInitialToken(T);
     Ref Inner = ref(childAt(T, 1));
+    if (I >= kMaxChainPrefixes) {
+      // Past the cap only what the trailer holds is read: no prefix is rendered.
+      if (textIs(Tok.get(), "(") && rawCount(T) == 3)
+        processFunctionCall(W, Py_None, getUsedArgInfoList(Inner.get()).get());
+      else if (textIs(Tok.get(), "[") || textIs(Tok.get(), "{"))
+        visitLoadContextNode(W, Inner.get());
+      else if (!(textIs(Tok.get(), ".") && isNodeOf(Inner.get(), C::CNameLiteral)))
+        visitNode(W, Inner.get());
+      continue;
+    }
     bool PlainBefore = Plain;
     Plain = Plain && Py_TYPE(Trailer.get()) == &nodeType(C::CTrailer) && rawCount(T) == 2 &&
             textIs(Tok.get(), ".") && Py_TYPE(Inner.get()) == NameType && node(Inner.get())->Text &&
