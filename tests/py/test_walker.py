@@ -376,6 +376,24 @@ class LinearCostTest(unittest.TestCase):
         self.assertIn("name 'p0' is parameter and global", err)
 
 
+class KeptMemoryTest(unittest.TestCase):
+
+    def testRecordsShareNamesAndPairs(self):
+        from pysource import analysis
+        source = b'def f(self):\n    self.items.append(self.x)\n    return self.items.append(self.x)\n'
+        first, second = analysis.AnalyzeText(source, '3.8').logicals[1:]
+        pairs = dict((p, p) for p in second.fTypeEquivs)
+        self.assertEqual(len(first.fTypeEquivs), 5)
+        for pair in first.fTypeEquivs:
+            self.assertIs(pairs[pair], pair)  # one pair for both lines
+        long_name = b'n' * 200  # long texts are neither interned nor shared
+        logicals = utils.GetLogicalsFromText(b'x\ny\n')
+        for L in logicals:
+            L.AppendTypeEquiv(long_name, b'i')
+        self.assertIsNot(logicals[0].fTypeEquivs[0], logicals[1].fTypeEquivs[0])
+        self.assertEqual(logicals[0].fTypeEquivs[0], logicals[1].fTypeEquivs[0])
+
+
 class DeterminismTest(unittest.TestCase):
 
     def testSameUnderEveryHashSeed(self):
