@@ -475,7 +475,9 @@ def LineView(logical, error=None):
     defines (names defined), reads (names read), equivs ((name, info) type
     equivalences other than reads), args (argument names), arg_equivs ((name,
     info) pairs of the arguments), bases (base-class texts), error (None, or
-    a dict of message, line and column, 1-based). Texts are bytes.
+    a dict of message, line and column, 1-based), truncated (whether the walk
+    stopped at its limits, so that only what it recorded before is there).
+    Texts are bytes.
     """
     info = logical.GetDerivedInfo() or kNoDerivedInfo
     names, type_equivs, args, arg_equivs, bases = info
@@ -491,6 +493,7 @@ def LineView(logical, error=None):
         'arg_equivs': list(arg_equivs),
         'bases': list(bases),
         'error': None,
+        'truncated': bool(getattr(logical, 'fTruncated', False)),
     }
     if error is not None:
         line, column, message = ErrorLocation(logical, error)

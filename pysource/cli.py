@@ -11,7 +11,9 @@ Formats (--format):
           "lines": [...]}, ...]}
   jsonl   one object per logical line, with its "path" and "version"
 A line has the fields line, kind, text, defines, reads, equivs, args,
-arg_equivs, bases and error (null, or message, line and column, 1-based).
+arg_equivs, bases, error (null, or message, line and column, 1-based) and
+truncated (true when the walk stopped at its limits: only what it recorded
+before is there; a note on standard error names the line).
 Texts are the source bytes decoded as UTF-8; a byte that is not valid UTF-8
 appears as the lone surrogate U+DC80 + byte, so that in Python 3
 text.encode('utf-8', 'surrogateescape') gives back the exact bytes.
@@ -87,7 +89,7 @@ def _JsonPairs(pairs):
 
 
 kJsonNothingRecorded = (', "defines": [], "reads": [], "equivs": [], "args": [], '
-                        '"arg_equivs": [], "bases": [], "error": null}')
+                        '"arg_equivs": [], "bases": [], "error": null, "truncated": false}')
 
 
 def JsonLine(logical, error, prefix=''):
@@ -97,7 +99,8 @@ def JsonLine(logical, error, prefix=''):
         prefix, logical.fFirstLine + 1, analysis.KindName(logical.fKind),
         JsonString(logical.fLineText))
     info = logical.GetDerivedInfo()
-    if info is None and error is None:
+    truncated = logical.fTruncated
+    if info is None and error is None and not truncated:
         return head + kJsonNothingRecorded
     names, type_equivs, args, arg_equivs, bases = info or analysis.kNoDerivedInfo
     reads, equivs = analysis.SplitReads(type_equivs)
@@ -106,9 +109,10 @@ def JsonLine(logical, error, prefix=''):
     else:
         error_json = '{"message": %s, "line": %d, "column": %d}' % _ErrorFields(logical, error)
     return '%s, "defines": %s, "reads": %s, "equivs": %s, "args": %s, "arg_equivs": %s, ' \
-        '"bases": %s, "error": %s}' % (
+        '"bases": %s, "error": %s, "truncated": %s}' % (
             head, _JsonStrings(names), _JsonStrings(reads), _JsonPairs(equivs),
-            _JsonStrings(args), _JsonPairs(arg_equivs), _JsonStrings(bases), error_json)
+            _JsonStrings(args), _JsonPairs(arg_equivs), _JsonStrings(bases), error_json,
+            'true' if truncated else 'false')
 
 
 def _ErrorFields(logical, error):
@@ -130,10 +134,15 @@ def _Pairs(pairs):
     return b', '.join(n + b' = ' + i for n, i in pairs)
 
 
+kTruncatedText = b'    truncated: the walk stopped at its limits; only what it recorded before is shown\n'
+kTruncatedNote = ('%s:%d: note: the walk stopped at its limits (10000 visits, nesting depth 40); '
+                  'only what it recorded before is reported\n')
+
+
 def TextBlock(path, logical, error):
     """The text block of one analyzed record, or b'' when it records nothing."""
     info = logical.GetDerivedInfo()
-    if info is None and error is None:
+    if info is None and error is None and not logical.fTruncated:
         return b''
     names, type_equivs, args, arg_equivs, bases = info or analysis.kNoDerivedInfo
     reads, equivs = analysis.SplitReads(type_equivs)
@@ -143,6 +152,8 @@ def TextBlock(path, logical, error):
     lines = [b'    %s: %s\n' % (label, value) for label, value in fields if value]
     if error is not None:
         lines.append(b'    error: %d:%d: %s\n' % analysis.ErrorLocation(logical, error))
+    if logical.fTruncated:
+        lines.append(kTruncatedText)
     return b'%s:%d: [%s] %s\n' % (path, logical.fFirstLine + 1, analysis.KindName(logical.fKind),
                                   _FirstLine(logical.fLineText).strip()) + b''.join(lines)
 
@@ -170,6 +181,10 @@ def Report(result, options):
     if result.problem is not None:
         problem = '%s: %s: %s\n' % (path, 'note' if result.status == analysis.kSkipped
                                     else 'error', result.problem)
+    notes = ''.join([kTruncatedNote % (path, l.fFirstLine + 1) for l in result.logicals
+                     if l.fTruncated])
+    if notes:
+        problem = (problem or '') + notes
     pairs = zip(result.logicals, result.errors)
     if options.errors_only:
         pairs = [(l, e) for l, e in pairs if e is not None]
@@ -254,6 +269,14 @@ class Progress(object):
             self.drawn = False
 
 
+class _Discard(object):
+    def write(self, text):
+        pass
+
+    def flush(self):
+        pass
+
+
 class _Silent(object):
     def isatty(self):
         return False
@@ -326,9 +349,10 @@ def Main(argv=None, stdin=None, stdout=None, stderr=None):
     stdin = stdin or getattr(sys.stdin, 'buffer', sys.stdin)
     out = stdout or getattr(sys.stdout, 'buffer', sys.stdout)
     err = stderr or sys.stderr
-    # The analyzer writes its diagnostics (a walk that hit its limits) to
-    # sys.stdout; they go to standard error, the output stays parseable.
-    saved_stdout, sys.stdout = sys.stdout, err
+    # The analyzer writes a line to sys.stdout when a walk hits its limits;
+    # Report notes those lines on standard error with their path and line,
+    # so that line is dropped and the output stays parseable.
+    saved_stdout, sys.stdout = sys.stdout, _Discard()
     try:
         return _Run(args, stdin, out, err)
     finally:

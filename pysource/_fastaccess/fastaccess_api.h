@@ -20,7 +20,9 @@ struct TokenPos {
 };
 
 /// Flag bits of LogicalLineObject::Flags.
-enum : uint8_t { kFlagInspected = 1 };
+/// kFlagTruncated: a walk of the record stopped at its limits, so the derived
+/// info holds only what was recorded up to there; cleared with the derived info.
+enum : uint8_t { kFlagInspected = 1, kFlagTruncated = 2 };
 
 /// A logical-line record. Invariant: Texts[0..TokenCount) are byte strings
 /// (owned), Types[i] == token type code of Texts[i], Positions[i] its position.

@@ -57,11 +57,44 @@ void appendTo(PyObject **Slot, PyObject *Item) {
   tl::requireStatus(PyList_Append(derivedList(Slot), Item));
 }
 
-void appendBytes(PyObject **Slot, PyObject *Text) { appendTo(Slot, exactBytes(Text).get()); }
+// Kept records repeat the same names and infos, and the same (name, info)
+// pairs (a name read is (name, kGetPrefix)): short texts are interned and
+// short pairs shared through a bounded cache, so that a kept analysis holds
+// one of each. Sharing is invisible: the texts and pairs are immutable.
+constexpr Py_ssize_t kShareMaxLen = 80;
+constexpr Py_ssize_t kMaxSharedPairs = 1 << 16;
+PyObject *SharedPairs = nullptr; ///< dict: pair -> the same pair
+
+/// New reference: exactBytes(Obj), interned when it is short.
+Ref sharedBytes(PyObject *Obj) {
+  Ref Text = exactBytes(Obj);
+  if (PyString_GET_SIZE(Text.get()) > kShareMaxLen || PyString_CHECK_INTERNED(Text.get()))
+    return Text;
+  PyObject *O = Text.release();
+  PyString_InternInPlace(&O);
+  return Ref::steal(O);
+}
+
+/// New reference: the pair (Name, Info), shared with earlier records when short.
+Ref sharedPair(PyObject *Name, PyObject *Info) {
+  Ref N = sharedBytes(Name), I = sharedBytes(Info);
+  Ref Pair = require(PyTuple_Pack(2, N.get(), I.get()));
+  if (!PyString_CHECK_INTERNED(N.get()) || !PyString_CHECK_INTERNED(I.get()))
+    return Pair;
+  if (!SharedPairs)
+    SharedPairs = require(PyDict_New()).release();
+  if (PyObject *Found = PyDict_GetItem(SharedPairs, Pair.get()))
+    return Ref::borrow(Found);
+  if (PyDict_Size(SharedPairs) >= kMaxSharedPairs)
+    PyDict_Clear(SharedPairs);
+  tl::requireStatus(PyDict_SetItem(SharedPairs, Pair.get(), Pair.get()));
+  return Pair;
+}
+
+void appendBytes(PyObject **Slot, PyObject *Text) { appendTo(Slot, sharedBytes(Text).get()); }
 
 void appendPair(PyObject **Slot, PyObject *Name, PyObject *Info) {
-  Ref Pair = require(PyTuple_Pack(2, exactBytes(Name).get(), exactBytes(Info).get()));
-  appendTo(Slot, Pair.get());
+  appendTo(Slot, sharedPair(Name, Info).get());
 }
 
 /// New reference: a copy of a derived list (empty when there is none).
@@ -320,6 +353,10 @@ int set_inspected(PyObject *O, PyObject *V, void *) {
   return 0;
 }
 
+PyObject *get_truncated(PyObject *O, void *) {
+  return PyBool_FromLong(self(O)->Flags & kFlagTruncated);
+}
+
 PyObject *optional(PyObject *V) {
   if (!V)
     V = Py_None;
@@ -451,6 +488,8 @@ PyGetSetDef GetSets[] = {
     TL_GET("fTokenCount", get_token_count, "number of tokens"),
     TL_GET("fKind", get_kind, "0 statement, 1 class, 2 def, 11 try, 21 comment, 22 blank"),
     TL_GETSET("fInspected", get_inspected, set_inspected, "set once the analyzer has seen it"),
+    TL_GET("fTruncated", get_truncated,
+           "whether the analysis stopped at the walker's limits, recording only what came before"),
     TL_GETSET("fParentScope", get_parent_scope, set_parent_scope,
               "the enclosing def/class logical, or None"),
     TL_GETSET("fLocalScopeDefined", get_local_scope, set_local_scope,
@@ -481,6 +520,7 @@ void expectBytes(PyObject *Obj) { tl::expectType(PyString_Check(Obj), msg::Bytes
 int clearDerivedInfo(PyObject *Logical) {
   return guard(-1, [&] {
     LogicalLineObject *L = asLogical(Logical);
+    L->Flags &= ~kFlagTruncated;
     PyObject *Lists[] = {L->NamesDefined, L->TypeEquivs, L->ArgNames, L->ArgTypeEquivs,
                          L->BaseClassNames};
     for (PyObject *List : Lists)

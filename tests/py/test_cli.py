@@ -124,7 +124,7 @@ class CliTest(unittest.TestCase):
         self.assertEqual((line['defines'], line['reads'], line['equivs'], line['error']),
                          (['s'], [], [['s', u':l:string: \'caf\udce9\'']], None))
         self.assertEqual(sorted(line), ['arg_equivs', 'args', 'bases', 'defines', 'equivs',
-                                        'error', 'kind', 'line', 'reads', 'text'])
+                                        'error', 'kind', 'line', 'reads', 'text', 'truncated'])
 
     def testSymlinkLoopAndMixedVersions(self):
         self.Write('pkg/old.py', b'print "x"\n')

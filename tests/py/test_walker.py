@@ -1,7 +1,11 @@
 """The symbol walker: what lines record under each grammar, the walk limits, and CDispatchWalker."""
 
 import gc
+import json
+import os
+import re
 import StringIO
+import subprocess
 import sys
 import unittest
 
@@ -120,7 +124,7 @@ class RecordsTest(unittest.TestCase):
         self.check('2.7', b'def f(a, (b, c), d=None): pass\n', args=[b'a', b'b', b'c', b'd'],
                    arg_equivs=[(b'd', tl.kLiteralPrefix + b'None: None')])
         self.check('3.6', b'f = lambda x, y=z: x\n', [b'f'], {b'x', b'z'},
-                   [(b'y', si.kWithinExprPrefix + b'5'), (b'x', si.kWithinExprPrefix + b'3')])
+                   [(b'x', si.kWithinExprPrefix + b'3'), (b'y', si.kWithinExprPrefix + b'5')])
         self.check('2.7', b'f = lambda (a, b): a\n', [b'f'], {b'a'})
         self.check('3.6', b'class C(Base, m.Mixin, metaclass=M): pass\n', [], set(), [], bases=[b'Base', b'm.Mixin'])
         self.check('3.6', b'class C(*bases): pass\n', bases=[])  # a starred sequence is no base class
@@ -227,13 +231,13 @@ def Idle(walker):
 class DriverTest(unittest.TestCase):
 
     def testLimitsReportAndRecover(self):
-        deep = b'x = ' + b'(' * 45 + b'y' + b')' * 45 + b'\n'
+        deep = b'x = a.b + c + ' + b'(' * 45 + b'y' + b')' * 45 + b'\n'
         with CapturedStdout() as out:
             result, defined, reads = Record('3.6', deep)[:3]
         self.assertIsNone(result)
         self.assertEqual(out.getvalue(), 'RuntimeError raised in CNodeWalker.Walk: '
                          "RuntimeError('Maximum recurse count in _VisitNode exceeded',)\n")
-        self.assertEqual((defined, reads), ([b'x'], set()))  # the names collected are not recorded
+        self.assertEqual((defined, reads), ([b'x'], {b'a', b'a.b', b'c'}))  # what came before the limit
         walker = support.Analyzer('3.6')._fNodeWalker
         self.assertTrue(Idle(walker))
         self.assertEqual((walker._fLoadedNames, walker._fStoredNames), ({}, {}))
@@ -286,6 +290,128 @@ class DriverTest(unittest.TestCase):
         walker._ProcessLoadName(b'q')
         self.assertEqual(walker._fLoadedNames, {b'q': b''})
         self.assertRaises(TypeError, walker._VisitExprStmt, node.GetInitialTestExpr())
+
+
+class TruncatedTest(unittest.TestCase):
+    """A line past the walk's limits keeps what was recorded, is marked, and is noted with its path and line."""
+
+    kSource = (b'ok = 1\n'
+               b'x = [' + b', '.join(b'n%d' % i for i in range(6000)) + b']\n'  # past 10000 visits
+               b'y = p + ' + b'(' * 45 + b'q' + b')' * 45 + b'\n'                # past depth 40
+               b'z = r\n')
+
+    def testMarkedAndKept(self):
+        from pysource import analysis
+        with CapturedStdout():
+            result = analysis.AnalyzeText(self.kSource, '3.6', path='t.py')
+        views = result.Lines()
+        self.assertEqual([v['truncated'] for v in views], [False, True, True, False])
+        self.assertEqual(views[1]['reads'][:3], [b'n0', b'n1', b'n2'])
+        self.assertGreater(len(views[1]['reads']), 4000)
+        self.assertEqual((views[2]['reads'], views[3]['reads']), ([b'p'], [b'r']))
+        logical = result.logicals[1]
+        from pysource import _fastaccess
+        _fastaccess.ClearLogicalDerivedInfo(logical)  # the mark goes with the derived info
+        self.assertFalse(logical.fTruncated)
+
+    def testCommandLineReports(self):
+        from pysource import cli
+        for fmt, marks in (('jsonl', ['"truncated": false', '"truncated": true', '"truncated": true',
+                                      '"truncated": false']),
+                           ('text', [None, 'truncated: the walk stopped', 'truncated: the walk stopped', None])):
+            out, err = StringIO.StringIO(), StringIO.StringIO()
+            status = cli.Main(['--lang', '3.6', '--format', fmt, '--stdin-filename', 'in.py', '-'],
+                              stdin=StringIO.StringIO(self.kSource), stdout=out, stderr=err)
+            self.assertEqual(status, 0)
+            if fmt == 'jsonl':
+                blocks = out.getvalue().splitlines()
+            else:
+                blocks = re.split(r'\n(?=in\.py:)', out.getvalue())
+            self.assertEqual([m is None or m in b for m, b in zip(marks, blocks)], [True] * 4, fmt)
+            self.assertEqual(len(blocks), 4)
+            notes = [l for l in err.getvalue().splitlines() if 'note' in l]
+            self.assertEqual([n.split(': note:')[0] for n in notes], ['in.py:2', 'in.py:3'])
+            self.assertNotIn('RuntimeError', err.getvalue())
+
+
+class LinearCostTest(unittest.TestCase):
+    """Long chains record a bounded number of prefixes; one line's checks are linear in its names."""
+
+    def testChainsRecordBoundedPrefixes(self):
+        shapes = [(b'x = a%s\n', b'.a'), (b'x = a%s\n', b'.b()'), (b'x: a%s = 1\n', b'.a'),
+                  (b'@a%s\n', b'.a'), (b'a%s = 1\n', b'[i].b')]
+        for shape, piece in shapes:
+            sizes = []
+            for n in (20, 200, 2000):
+                source = shape % (piece * n)
+                L = support.AnalyzeLine('3.8', source)[1]
+                infos = list(L.fTypeEquivs) + [(n, b'') for n in L.fNamesDefined]
+                sizes.append((len(infos), sum(len(n) + len(i) for n, i in infos) // len(source)))
+            # Entries stop growing past the cap; their bytes stay a bounded multiple of the line.
+            self.assertEqual(sizes[1][0], sizes[2][0], (shape, piece, sizes))
+            self.assertLessEqual(sizes[2][1], 4, (shape, piece, sizes))
+        reads = Record('3.8', b'x = a' + b'.a' * 40 + b'(q)\n')[2]
+        self.assertEqual(len(reads), 34)  # a, a.a ... 32 trailers deep, and the argument q
+        self.assertIn(b'q', reads)
+
+    def testChecksLinearInNames(self):
+        # 200,000 names: comparing every pair takes many minutes; a minute of CPU is generous.
+        script = ('import resource, sys; resource.setrlimit(resource.RLIMIT_CPU, (60, 60)); '
+                  'sys.stdout = open("/dev/null", "w"); '
+                  'from pysource import analysis; n = 200000; '
+                  'kw = b"f(" + b", ".join(b"k%d=1" % i for i in range(n)) + b", k7=2)\\n"; '
+                  'params = b", ".join(b"p%d" % i for i in range(n)); '
+                  'df = b"def f(" + params + b", p5): global " + params + b"\\n"; '
+                  'gl = b"def f(" + params + b"): global " + params + b"\\n"; '
+                  'print >>sys.stderr, [analysis.AnalyzeText(s, "3.8").SyntaxErrors() for s in (kw, df, gl)]')
+        env = dict(os.environ, PYTHONPATH=support.kRoot)
+        if 'TREELENS_BUILD_DIR' in env:
+            env['TREELENS_BUILD_DIR'] = os.path.abspath(env['TREELENS_BUILD_DIR'])
+        proc = subprocess.Popen([sys.executable, '-c', script], stdout=subprocess.PIPE, stderr=subprocess.PIPE,
+                                env=env, cwd=support.kRoot)
+        out, err = proc.communicate()
+        self.assertEqual(proc.returncode, 0, err[-2000:])
+        self.assertIn("keyword argument repeated", err)
+        self.assertIn("duplicate argument 'p5' in function definition", err)
+        self.assertIn("name 'p0' is parameter and global", err)
+
+
+class KeptMemoryTest(unittest.TestCase):
+
+    def testRecordsShareNamesAndPairs(self):
+        from pysource import analysis
+        source = b'def f(self):\n    self.items.append(self.x)\n    return self.items.append(self.x)\n'
+        first, second = analysis.AnalyzeText(source, '3.8').logicals[1:]
+        pairs = dict((p, p) for p in second.fTypeEquivs)
+        self.assertEqual(len(first.fTypeEquivs), 5)
+        for pair in first.fTypeEquivs:
+            self.assertIs(pairs[pair], pair)  # one pair for both lines
+        long_name = b'n' * 200  # long texts are neither interned nor shared
+        logicals = utils.GetLogicalsFromText(b'x\ny\n')
+        for L in logicals:
+            L.AppendTypeEquiv(long_name, b'i')
+        self.assertIsNot(logicals[0].fTypeEquivs[0], logicals[1].fTypeEquivs[0])
+        self.assertEqual(logicals[0].fTypeEquivs[0], logicals[1].fTypeEquivs[0])
+
+
+class DeterminismTest(unittest.TestCase):
+
+    def testSameUnderEveryHashSeed(self):
+        outputs = set()
+        for seed, jobs in (('1', '1'), ('2', '1'), ('3', '2')):
+            env = dict(os.environ, PYTHONPATH=support.kRoot, PYTHONHASHSEED=seed)
+            if 'TREELENS_BUILD_DIR' in env:
+                env['TREELENS_BUILD_DIR'] = os.path.abspath(env['TREELENS_BUILD_DIR'])
+            proc = subprocess.Popen([sys.executable, '-m', 'pysource.cli', '-q', '-j', jobs, '--format',
+                                     'jsonl', os.path.join(support.kRoot, 'examples')],
+                                    stdout=subprocess.PIPE, stderr=subprocess.PIPE, env=env)
+            out, err = proc.communicate()
+            self.assertEqual(proc.returncode, 0, err)
+            outputs.add(out)
+        self.assertEqual(len(outputs), 1)
+        # Names read are in the order the line first mentions them.
+        line = [json.loads(l) for l in outputs.pop().splitlines() if 'results = await asyncio' in l][0]
+        self.assertEqual(line['reads'], ['asyncio', 'asyncio.gather', 'self', 'self.fetch', 'u', 'urls'])
 
 
 def WalkerState(**fields):

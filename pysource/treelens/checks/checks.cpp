@@ -11,6 +11,7 @@
 #include <string.h>
 
 #include <string>
+#include <unordered_set>
 #include <vector>
 
 namespace treelens {
@@ -887,16 +888,16 @@ void Checker::futureImport(N *X, Py_ssize_t Names, bool Top) {
 
 void Checker::namesStmt(N *X, const Scope &S, bool Nonlocal) {
   const Scope *F = function(S);
-  for (Py_ssize_t I = 1; I < count(X); I += 2) {
-    N *Name = child(X, I);
-    if (F && F->Params && F == &S) {
-      for (const std::string &P : *F->Params) {
-        if (P == text(Name)) {
-          std::string Msg = std::string("name '") + text(Name) + "' is " +
-                            (Py3 ? "parameter" : "local") + " and " + (Nonlocal ? "nonlocal" : "global");
-          report(kSymtable, X, Msg);
-          return;
-        }
+  if (F && F->Params && F == &S && !F->Params->empty()) {
+    // One set of the parameters, so that many names against many parameters stay linear.
+    std::unordered_set<std::string> Params(F->Params->begin(), F->Params->end());
+    for (Py_ssize_t I = 1; I < count(X); I += 2) {
+      N *Name = child(X, I);
+      if (Params.count(text(Name))) {
+        std::string Msg = std::string("name '") + text(Name) + "' is " + (Py3 ? "parameter" : "local") +
+                          " and " + (Nonlocal ? "nonlocal" : "global");
+        report(kSymtable, X, Msg);
+        return;
       }
     }
   }
@@ -1096,7 +1097,7 @@ void Checker::call(N *Args, const Scope &S) {
   }
   int Keywords = 0;
   bool DoubleStars = false, Vararg = false;
-  std::vector<std::string> Names;
+  std::unordered_set<std::string> Names; // keyword names so far
   for (Py_ssize_t I = 0; I < Count; ++I) {
     N *A = item(I);
     if (textIs(A, ","))
@@ -1150,13 +1151,10 @@ void Checker::call(N *Args, const Scope &S) {
       }
       N *KeyName = strip(Key);
       storeName(KeyName, Py3 && !Py38 ? A : Key, true);
-      for (const std::string &Prev : Names) {
-        if (Prev == text(KeyName)) {
-          report(kAst, Key, "keyword argument repeated");
-          return;
-        }
+      if (!Names.insert(text(KeyName)).second) {
+        report(kAst, Key, "keyword argument repeated");
+        return;
       }
-      Names.push_back(text(KeyName));
       ++Keywords;
       load(child(A, 2), S);
       continue;
@@ -1765,12 +1763,12 @@ void Checker::parameters(N *X, const Scope &S, std::vector<std::string> &Names, 
     if (Default)
       I += 2;
   }
-  for (size_t I = 0; I < Names.size(); ++I) {
-    for (size_t J = 0; J < I; ++J) {
-      if (Names[I] == Names[J]) {
-        report(kSymtable, Owner, "duplicate argument '" + Names[I] + "' in function definition");
-        return;
-      }
+  // The first name that repeats an earlier one, found in one pass.
+  std::unordered_set<std::string> Seen;
+  for (const std::string &Name : Names) {
+    if (!Seen.insert(Name).second) {
+      report(kSymtable, Owner, "duplicate argument '" + Name + "' in function definition");
+      return;
     }
   }
 }

@@ -255,8 +255,23 @@ void visitLoadContextNode(NW *W, PyObject *Node) {
   visitNode(W, Node);
 }
 
+namespace {
+
+/// Appends Name to the walk's order list *Order, making the list first.
+void noteOrder(PyObject **Order, PyObject *Name) {
+  if (!*Order || !PyList_Check(*Order))
+    Py_XSETREF(*Order, tl::require(PyList_New(0)).release());
+  tl::requireStatus(PyList_Append(*Order, Name));
+}
+
+} // namespace
+
 void processLoadName(NW *W, PyObject *Name) {
-  tl::requireStatus(PyDict_SetItem(dictField(W->LoadedNames, "_fLoadedNames"), Name, K.Empty));
+  PyObject *Loaded = dictField(W->LoadedNames, "_fLoadedNames");
+  if (tl::requireStatus(PyDict_Contains(Loaded, Name)))
+    return;
+  tl::requireStatus(PyDict_SetItem(Loaded, Name, K.Empty));
+  noteOrder(&W->LoadedOrder, Name);
 }
 
 namespace {
@@ -292,6 +307,8 @@ void visitName(NW *W, PyObject *Node, PyObject *Atom, PyObject *AllTrailers, Py_
       Info = concat({Old.get(), K.Semicolon, Info.get()});
     }
     tl::requireStatus(PyDict_SetItem(Stored, Name.get(), Info.get()));
+    if (!Old)
+      noteOrder(&W->StoredOrder, Name.get());
   }
 }
 
@@ -307,7 +324,8 @@ void visitDottedName(NW *W, PyObject *Node) {
   if (!PyList_Check(Children.get()))
     return;
   std::string Text;
-  for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Children.get()); ++I) {
+  // Parts and dots alternate: the prefixes of the first kMaxChainPrefixes + 1 parts are read.
+  for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Children.get()) && I <= 2 * kMaxChainPrefixes; ++I) {
     Ref Child = Ref::borrow(PyList_GET_ITEM(Children.get(), I));
     PyObject *Piece = asAnyNode(Child.get())->Text;
     if (!Piece || !PyString_Check(Piece))
@@ -493,33 +511,55 @@ void appendEquivNode(NW *W, PyObject *NameNode, PyObject *EquivNode) {
   }
 }
 
+namespace {
+
+/// Calls Emit(name, value) for each entry of the dict D: first the names of
+/// Order that D holds, in that order, then any other keys (put there by a
+/// caller, not the walk) sorted, so that the result never follows hashing.
+/// Emit runs on a snapshot, so it may run Python code.
+template <class F> void eachInOrder(PyObject *D, PyObject *Order, bool Checked, const char *Field, F &&Emit) {
+  if (PyDict_Size(D) == 0)
+    return;
+  Ref Rest = tl::require(PyDict_Copy(D));
+  Ref Items = tl::require(PyList_New(0));
+  Ref Snapshot = Order && PyList_Check(Order) ? tl::require(PyList_GetSlice(Order, 0, PyList_GET_SIZE(Order)))
+                                              : tl::require(PyList_New(0));
+  auto take = [&](PyObject *Name) {
+    PyObject *Value = PyDict_GetItem(Rest.get(), Name);
+    if (!Value)
+      return;
+    Ref Pair = tl::require(PyTuple_Pack(2, Name, Value));
+    tl::requireStatus(PyDict_DelItem(Rest.get(), Name));
+    tl::requireStatus(PyList_Append(Items.get(), Pair.get()));
+  };
+  for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Snapshot.get()); ++I)
+    take(PyList_GET_ITEM(Snapshot.get(), I));
+  if (PyDict_Size(Rest.get())) {
+    Ref Keys = tl::require(PyDict_Keys(Rest.get()));
+    tl::requireStatus(PyList_Sort(Keys.get()));
+    for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Keys.get()); ++I)
+      take(PyList_GET_ITEM(Keys.get(), I));
+  }
+  for (Py_ssize_t I = 0; I < PyList_GET_SIZE(Items.get()); ++I) {
+    PyObject *Item = PyList_GET_ITEM(Items.get(), I);
+    PyObject *Name = PyTuple_GET_ITEM(Item, 0);
+    if (Checked && Name == Py_None)
+      tl::raiseFormat(PyExc_AssertionError, "None name in %s", Field);
+    Emit(Name, PyTuple_GET_ITEM(Item, 1));
+  }
+}
+
+} // namespace
+
 void processNamesFound(NW *W, PyObject *Node) {
   if (isNodeOf(Node, C::CImportNamesStmt) || isNodeOf(Node, C::CFromImportStmt))
     return;
   bool Checked = Py_OptimizeFlag == 0;
-  // A record of the host's own type runs no Python code while appending, so
-  // the dicts are iterated in place; anything else gets a snapshot.
-  bool InPlace = host::isLogical(logical(W));
   PyObject *Loaded = dictField(W->LoadedNames, "_fLoadedNames");
-  Ref LoadedKeys = InPlace ? Ref::borrow(Loaded) : tl::require(PyDict_Keys(Loaded));
-  Py_ssize_t Pos = 0, I = 0;
-  PyObject *Name, *Joined;
-  while (InPlace ? PyDict_Next(Loaded, &Pos, &Name, &Joined)
-                 : I < PyList_GET_SIZE(LoadedKeys.get()) && (Name = PyList_GET_ITEM(LoadedKeys.get(), I++))) {
-    if (Checked && Name == Py_None)
-      tl::raise(PyExc_AssertionError, "None name in _fLoadedNames");
-    recordTypeEquiv(W, Name, sym(Sym::kGetPrefix));
-  }
+  eachInOrder(Loaded, W->LoadedOrder, Checked, "_fLoadedNames",
+              [&](PyObject *Name, PyObject *) { recordTypeEquiv(W, Name, sym(Sym::kGetPrefix)); });
   PyObject *StoredDict = dictField(W->StoredNames, "_fStoredNames");
-  if (PyDict_Size(StoredDict) == 0)
-    return;
-  Ref Stored = tl::require(PyDict_Items(StoredDict));
-  for (Py_ssize_t J = 0; J < PyList_GET_SIZE(Stored.get()); ++J) {
-    PyObject *Item = PyList_GET_ITEM(Stored.get(), J);
-    Name = PyTuple_GET_ITEM(Item, 0);
-    Joined = PyTuple_GET_ITEM(Item, 1);
-    if (Checked && Name == Py_None)
-      tl::raise(PyExc_AssertionError, "None name in _fStoredNames");
+  eachInOrder(StoredDict, W->StoredOrder, Checked, "_fStoredNames", [&](PyObject *Name, PyObject *Joined) {
     tl::expectType(PyString_Check(Joined), "bytes", Joined);
     const char *P = PyString_AS_STRING(Joined);
     const char *End = P + PyString_GET_SIZE(Joined);
@@ -532,7 +572,7 @@ void processNamesFound(NW *W, PyObject *Node) {
         break;
       P = Sep + 1;
     }
-  }
+  });
 }
 
 // ---- Imports ----
@@ -811,6 +851,16 @@ void visitAtomPlusTrailers(NW *W, PyObject *Atom, PyObject *AllTrailers) {
     NodeObject *T = asNodeOf(Trailer.get(), C::CTrailer);
     Ref Tok = trailerGetInitialToken(T);
     Ref Inner = ref(childAt(T, 1));
+    if (I >= kMaxChainPrefixes) {
+      // Past the cap only what the trailer holds is read: no prefix is rendered.
+      if (textIs(Tok.get(), "(") && rawCount(T) == 3)
+        processFunctionCall(W, Py_None, getUsedArgInfoList(Inner.get()).get());
+      else if (textIs(Tok.get(), "[") || textIs(Tok.get(), "{"))
+        visitLoadContextNode(W, Inner.get());
+      else if (!(textIs(Tok.get(), ".") && isNodeOf(Inner.get(), C::CNameLiteral)))
+        visitNode(W, Inner.get());
+      continue;
+    }
     bool PlainBefore = Plain;
     Plain = Plain && Py_TYPE(Trailer.get()) == &nodeType(C::CTrailer) && rawCount(T) == 2 &&
             textIs(Tok.get(), ".") && Py_TYPE(Inner.get()) == NameType && node(Inner.get())->Text &&

@@ -207,6 +207,13 @@ void reportWalkRuntimeError() {
 
 namespace {
 
+/// Marks a record whose walk stopped at a limit (or another RuntimeError):
+/// what it holds is what the walk recorded up to there.
+void markTruncated(PyObject *Logical) {
+  if (Logical && PyObject_TypeCheck(Logical, host::Host.LogicalLineType))
+    reinterpret_cast<host::LogicalLineObject *>(Logical)->Flags |= fastaccess::kFlagTruncated;
+}
+
 /// Back to idle: no logical, counters 0, name dicts empty.
 void resetNodeWalker(NW *W) {
   keepingError([&] {
@@ -218,6 +225,11 @@ void resetNodeWalker(NW *W) {
       PyDict_Clear(W->LoadedNames);
     if (W->StoredNames && PyDict_Check(W->StoredNames))
       PyDict_Clear(W->StoredNames);
+    for (PyObject *Order : {W->LoadedOrder, W->StoredOrder})
+      if (Order && PyList_Check(Order) && PyList_GET_SIZE(Order))
+        PyList_SetSlice(Order, 0, PyList_GET_SIZE(Order), nullptr);
+    if (PyErr_Occurred())
+      PyErr_Clear();
     Py_XDECREF(Logical);
   });
 }
@@ -233,14 +245,21 @@ void nodeWalkerWalk(NW *W, PyObject *Node, PyObject *Logical) {
   W->Logical = Logical;
   W->LoadNameContext = true;
   W->StoreWithinSubExpr = false;
+  bool Visited = false;
   bool Ok = tl::guard<bool>(false, [&] {
     visitNode(W, Node);
+    Visited = true;
     processNamesFound(W, Node);
     return true;
   });
   if (!Ok && PyErr_ExceptionMatches(PyExc_RuntimeError)) {
     reportWalkRuntimeError();
-    Ok = true;
+    markTruncated(Logical);
+    // The names met before the limit are recorded all the same.
+    Ok = Visited || tl::guard<bool>(false, [&] {
+      processNamesFound(W, Node);
+      return true;
+    });
   }
   resetNodeWalker(W);
   if (!Ok)
@@ -363,6 +382,7 @@ void dispatchWalkBase(DispatchWalkerObject *W, PyObject *Node, PyObject *Logical
   });
   if (!Ok && PyErr_ExceptionMatches(PyExc_RuntimeError)) {
     reportWalkRuntimeError();
+    markTruncated(Logical);
     Ok = true;
   }
   resetDispatchWalker(W);
@@ -447,6 +467,8 @@ int nodeWalkerTraverse(PyObject *Self, visitproc visit, void *arg) {
   Py_VISIT(W->LoadedNames);
   Py_VISIT(W->StoredNames);
   Py_VISIT(W->ToText);
+  Py_VISIT(W->LoadedOrder);
+  Py_VISIT(W->StoredOrder);
   return 0;
 }
 
@@ -456,6 +478,8 @@ int nodeWalkerClear(PyObject *Self) {
   Py_CLEAR(W->LoadedNames);
   Py_CLEAR(W->StoredNames);
   Py_CLEAR(W->ToText);
+  Py_CLEAR(W->LoadedOrder);
+  Py_CLEAR(W->StoredOrder);
   return 0;
 }
 

@@ -24,6 +24,11 @@ struct NodeWalkerObject {
   int MaxRecurseCount;
   PyObject *ToText; ///< CNodeToTextConverter with every option on
   bool IncludeExprText;
+  // The names of LoadedNames and StoredNames in the order the walk first met
+  // them (lists, NULL until the first name), so that what a line records does
+  // not depend on string hashing.
+  PyObject *LoadedOrder;
+  PyObject *StoredOrder;
 };
 
 /// CDispatchWalker and its subclasses (CTypeHintWalker extends this layout).

@@ -12,6 +12,13 @@ namespace walker {
 
 using NW = NodeWalkerObject;
 
+/// How many leading trailers of one chain (`a.b(c)[d].e`) have their prefixes
+/// recorded: the names read (`a.b`) and the calls (`a.b = :r:(c)`). Past it
+/// arguments and subscripts are still read, but no prefix is rendered, so a
+/// chain of n trailers costs O(n) rather than O(n^2) in time and output. The
+/// longest chain of the standard libraries has 11 trailers.
+constexpr Py_ssize_t kMaxChainPrefixes = 32;
+
 /// Texts and constants the handlers use, made once at start-up (owned for the process).
 struct WalkerConstants {
   PyObject *Empty;                     ///< ""
