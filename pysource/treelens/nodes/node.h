@@ -18,6 +18,7 @@ struct ClassInfoObject {
   int NodeType;          ///< token type (< 256) or grammar symbol number
   PyObject *Name;        ///< state name, bytes; owned, NULL read as None
   NodeObject *FirstFree; ///< head of the free list; owned, NULL read as None
+  Py_ssize_t FreeCount;  ///< nodes the factory put on the free list and has not taken back (a bound, not a length)
 };
 
 /// CNode and every node class: all state a node has. NULL fields read as None.

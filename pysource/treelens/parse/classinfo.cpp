@@ -94,6 +94,7 @@ Py_ssize_t drainFreeList(ClassInfoObject *Info) {
     Py_DECREF(N);
     ++Count;
   }
+  Info->FreeCount = 0;
   return Count;
 }
 

@@ -36,11 +36,13 @@ Ref lookupEntry(PyObject *Mapping, int I) {
 }
 
 /// Pushes N on its class info's free list. Only nodes of exactly the class
-/// the state instantiates are recycled; any other node is simply released.
+/// the state instantiates are recycled, up to kMaxFreePerState of them; any
+/// other node is simply released.
 void pushFree(NodeObject *N) {
   ClassInfoObject *Info = N->ClsInfo;
-  if (!Info || reinterpret_cast<PyObject *>(Py_TYPE(N)) != Info->Cls)
+  if (!Info || reinterpret_cast<PyObject *>(Py_TYPE(N)) != Info->Cls || Info->FreeCount >= kMaxFreePerState)
     return;
+  ++Info->FreeCount;
   N->OnFreeList = true;
   NodeObject *Stale = N->NextFree;
   N->NextFree = Info->FirstFree; // takes over the record's reference to the old head
@@ -216,6 +218,8 @@ Ref newNode(ClassInfoObject *Info, PyObject *Value, PyObject *Context, PyObject 
     Info->FirstFree = N->NextFree;
     Py_XINCREF(Info->FirstFree);
     N->OnFreeList = false;
+    if (Info->FreeCount > 0)
+      --Info->FreeCount;
   } else {
     PyObject *Cls = Info->Cls ? Info->Cls : Py_None;
     PyTypeObject *T = PyType_Check(Cls) ? reinterpret_cast<PyTypeObject *>(Cls) : nullptr;

@@ -28,6 +28,10 @@ enum TokenCode : int {
 /// the pgen engine's own bound on symbol numbers.
 constexpr long kMaxStateNumber = 256 + (1L << 20);
 
+/// Most nodes one state's free list keeps: the nodes of one huge line are
+/// released instead of held for good.
+constexpr Py_ssize_t kMaxFreePerState = 1 << 14;
+
 /// Deepest level DiscardNodes descends to; deeper subtrees are released.
 constexpr int kMaxDiscardDepth = 100;
 
