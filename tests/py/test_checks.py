@@ -144,8 +144,30 @@ kNewIn38 = ['(a := 1)', '(f() := 1)', '(a.b := 1)', '[x := 1 for x in y]', '[y :
 kPlacedElsewhere = ('def f():\n    from os import *\n', 'async def f():\n    def g(): x = [a async for a in b]\n',
                     'def f():\n    return [i async for i in y]\n')
 
+# Tokens the lexer must tell apart for the grammar: (source, versions that accept it);
+# the others say 'invalid syntax'.
+kPy3Versions = ('3.5', '3.6', '3.7', '3.8')
+kTokenCases = [
+    ('x -> y', ()),
+    ('lambda: x -> y', ()),
+    ('def f() @= int: pass', ()),
+    ('x @= y', kPy3Versions),
+    ('a.b[0] @= c', kPy3Versions),
+    ('def f() -> int: pass', kPy3Versions),
+]
+
 
 class ChecksTest(unittest.TestCase):
+
+    def testTokensTheGrammarTellsApart(self):
+        wrong = []
+        for source, accepted in kTokenCases:
+            for version in analysis.kVersions:
+                want = None if version in accepted else 'invalid syntax'
+                got = mutants.Ours(version, source.encode('utf-8') + b'\n')
+                if (got and got[0]) != want:
+                    wrong.append((version, source, want, got))
+        self.assertEqual(wrong, [])
 
     def testCasesAgainstCPython(self):
         # CPython places "import *" in a def at the def; the line's own statement is all we have.

@@ -478,13 +478,14 @@ int parser_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
 
     Ref TokNumber2Name = tl::require(PyDict_Copy(Host.TokName));
     for (auto Entry : {std::make_pair(51, "RARROW"), std::make_pair(54, "ASYNC"), std::make_pair(53, "AWAIT"),
-                       std::make_pair(55, "COLONEQUAL")}) {
+                       std::make_pair(55, "COLONEQUAL"), std::make_pair(56, "ATEQUAL")}) {
       Ref K = tl::require(PyInt_FromLong(Entry.first));
       Ref V = tl::require(PyString_FromString(Entry.second));
       tl::requireStatus(PyDict_SetItem(TokNumber2Name.get(), K.get(), V.get()));
     }
     Ref OpText2Number = tl::require(PyDict_Copy(Host.OpMap));
-    for (auto Entry : {std::make_pair("...", 52), std::make_pair("->", 51), std::make_pair(":=", 55)}) {
+    for (auto Entry : {std::make_pair("...", 52), std::make_pair("->", 51), std::make_pair(":=", 55),
+                       std::make_pair("@=", 56)}) {
       Ref V = tl::require(PyInt_FromLong(Entry.second));
       tl::requireStatus(PyDict_SetItemString(OpText2Number.get(), Entry.first, V.get()));
     }
