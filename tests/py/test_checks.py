@@ -156,8 +156,40 @@ kTokenCases = [
     ('def f() -> int: pass', kPy3Versions),
 ]
 
+# The deepest nesting each CPython parses (its parser stack: 1500 entries, 1700 from 3.8 on),
+# as measured with each version's interpreter; 3.5 has 3.6's grammar depth and stack.
+kNestingForms = {
+    'parens': lambda n: 'x = ' + '(' * n + '1' + ')' * n,
+    'calls': lambda n: 'x = ' + 'f(' * n + '1' + ')' * n,
+    'nots': lambda n: 'x = ' + 'not ' * n + '1',
+    'lambdas': lambda n: 'x = ' + 'lambda: ' * n + '1',
+}
+kNestingLimits = {
+    '2.7': {'parens': 98, 'calls': 92, 'nots': 1480, 'lambdas': 740},
+    '3.5': {'parens': 92, 'calls': 87, 'nots': 1479, 'lambdas': 739},
+    '3.6': {'parens': 92, 'calls': 87, 'nots': 1479, 'lambdas': 739},
+    '3.7': {'parens': 92, 'calls': 87, 'nots': 1479, 'lambdas': 739},
+    '3.8': {'parens': 98, 'calls': 98, 'nots': 1679, 'lambdas': 839},
+}
+
 
 class ChecksTest(unittest.TestCase):
+
+    def testNestingLimits(self):
+        import StringIO
+        wrong = []
+        stdout, sys.stdout = sys.stdout, StringIO.StringIO()   # the walker's notes on deep trees
+        try:
+            for version, limits in sorted(kNestingLimits.items()):
+                for form, limit in sorted(limits.items()):
+                    for depth, want in ((limit, None), (limit + 1, 'invalid syntax')):
+                        source = kNestingForms[form](depth).encode('utf-8') + b'\n'
+                        got = mutants.Ours(version, source)
+                        if (got and got[0]) != want:
+                            wrong.append((version, form, depth, got))
+        finally:
+            sys.stdout = stdout
+        self.assertEqual(wrong, [])
 
     def testTokensTheGrammarTellsApart(self):
         wrong = []

@@ -512,7 +512,11 @@ int parser_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
       throw tl::PyErrSet();
     Py_XSETREF(P->Keywords, KeywordDict.release());
 
-    Ref CreateKwds = tl::require(Py_BuildValue("{sO}", "promotesinglechild", Py_True));
+    // CPython's parser stack holds 1500 nonterminals before 3.8 and 1700 from 3.8 on.
+    Ref Py38 = tl::require(Py_BuildValue("(ii)", 3, 8));
+    long MaxDepth = tl::requireStatus(PyObject_RichCompareBool(VersionTriple, Py38.get(), Py_GE)) ? 1700 : 1500;
+    Ref CreateKwds =
+        tl::require(Py_BuildValue("{sOsl}", "promotesinglechild", Py_True, "maxdepth", MaxDepth));
     Ref CreateArgs = tl::require(PyTuple_Pack(2, P->Grammar, Self));
     Py_XSETREF(P->Parser, tl::require(PyObject_Call(Host.CreateParser, CreateArgs.get(), CreateKwds.get()))
                               .release());
