@@ -92,8 +92,6 @@ def UsesPrintFunction(logicals):
 # ---- Tokens that a version's lexer rejects but its grammar cannot tell apart
 
 _kNumber, _kString = 2, 3
-_kPy2Long = re.compile(br'(?:0[xX][0-9a-fA-F]+|0[oObB]?[0-9]+|[0-9]+)[lL]\Z')
-_kPy2Octal = re.compile(br'0[0-9]*[1-9][0-9]*\Z')
 _kEscape = re.compile(br'\\(.)', re.S)
 _kHex4, _kHex8 = re.compile(br'[0-9a-fA-F]{4}'), re.compile(br'[0-9a-fA-F]{8}')
 _kNamedEscape = re.compile(br'\{[^{}\\\'"]+\}')
@@ -122,15 +120,140 @@ def _BadUnicodeEscape(body):
     return None
 
 
+_kDigits = frozenset(b'0123456789')
+_kHexDigits = frozenset(b'0123456789abcdefABCDEF')
+_kOctDigits = frozenset(b'01234567')
+_kBinDigits = frozenset(b'01')
+# Messages of 3.8's number lexer; the older ones say 'invalid token' for each.
+_kLeadingZeros = ('leading zeros in decimal integer literals are not permitted; '
+                  'use an 0o prefix for octal integers')
+
+
+def _NumberEnd(version, text):
+    """Where the version's lexer ends the number that `text` (a NUMBER token and
+    what follows it on its line) begins with: (end, None), or (None, message)
+    when the lexer rejects it."""
+    py3, underscores = version != '2.7', version not in ('2.7', '3.5')
+    new_messages = version >= '3.8'
+    n = len(text)
+
+    def At(i):
+        return text[i:i + 1]
+
+    def Fail(message):
+        return None, message if new_messages else 'invalid token'
+
+    def BadDigit(i, name):
+        # 3.8 names a decimal digit that an octal or binary literal cannot hold.
+        if new_messages and name in ('octal', 'binary') and i < n and At(i) in _kDigits:
+            return Fail("invalid digit '%s' in %s literal" % (At(i), name))
+        return Fail('invalid %s literal' % name)
+
+    def Digits(i, digits, name='decimal'):
+        # i is at a first digit; returns the end of the digit run, or a failure.
+        while True:
+            while i < n and At(i) in digits:
+                i += 1
+            if not (underscores and At(i) == b'_'):
+                return i, None
+            i += 1
+            if not (i < n and At(i) in digits):
+                return BadDigit(i, name)
+
+    def Tail(i):
+        # After the integer part: a fraction, an exponent, an imaginary suffix.
+        if At(i) == b'.':
+            i += 1
+            if i < n and At(i) in _kDigits:
+                i, failed = Digits(i, _kDigits)
+                if failed:
+                    return None, failed
+        if At(i) in (b'e', b'E'):
+            j = i + 1
+            sign = At(j) in (b'+', b'-')
+            if sign:
+                j += 1
+            if not (j < n and At(j) in _kDigits):
+                if sign:
+                    return Fail('invalid decimal literal')
+                return i, None            # '1e' is the number 1 and the name e
+            i, failed = Digits(j, _kDigits)
+            if failed:
+                return None, failed
+        if At(i) in (b'j', b'J'):
+            i += 1
+        return i, None
+
+    def Long(i):
+        return i + 1 if not py3 and At(i) in (b'l', b'L') else i
+
+    if At(0) == b'.':
+        return Tail(0)
+    if At(0) != b'0':
+        i, failed = Digits(0, _kDigits)
+        if failed:
+            return None, failed
+        if not py3 and At(i) in (b'l', b'L'):
+            return i + 1, None
+        return Tail(i)
+    prefix = At(1).lower()
+    for letter, digits, name in ((b'x', _kHexDigits, 'hexadecimal'), (b'o', _kOctDigits, 'octal'),
+                                 (b'b', _kBinDigits, 'binary')):
+        if prefix != letter:
+            continue
+        i = 2
+        if underscores and At(i) == b'_':
+            i += 1
+        if not (i < n and At(i) in digits):
+            return BadDigit(i, name)
+        i, failed = Digits(i, digits, name)
+        if failed:
+            return None, failed
+        if new_messages and name != 'hexadecimal' and i < n and At(i) in _kDigits:
+            return BadDigit(i, name)
+        return Long(i), None
+    # A decimal number with a leading zero: zeros only, or a float.
+    i = 1
+    if py3:
+        while True:
+            if underscores and At(i) == b'_':
+                i += 1
+                if not (i < n and At(i) in _kDigits):
+                    return Fail('invalid decimal literal')
+            if At(i) != b'0':
+                break
+            i += 1
+        nonzero = i < n and At(i) in _kDigits
+        if nonzero:
+            i, failed = Digits(i, _kDigits)
+            if failed:
+                return None, failed
+    else:
+        while i < n and At(i) in _kOctDigits:
+            i += 1
+        nonzero = i < n and At(i) in _kDigits
+        while i < n and At(i) in _kDigits:
+            i += 1
+    if At(i) in (b'.', b'e', b'E', b'j', b'J'):
+        return Tail(i)
+    if nonzero:
+        return Fail(_kLeadingZeros)
+    return Long(i), None
+
+
+def _NumberError(version, logical, index, text):
+    """The message for a number token the version's lexer rejects or ends
+    early (the rest is then a name the grammar does not take), or None."""
+    row, col = logical.fTokens[index][1]
+    line = logical.fLineText.splitlines(True)[row]
+    end, message = _NumberEnd(version, line[col:])
+    if message is None and end < len(text):
+        message = 'invalid syntax'
+    return message
+
+
 def _Py3TokenError(text, kind, version):
-    if kind == _kNumber:
-        if _kPy2Long.match(text):
-            return 'invalid syntax'
-        if _kPy2Octal.match(text):
-            return 'invalid token'
-        if version == '3.5' and b'_' in text:
-            return 'invalid syntax'
-    elif kind == _kString:
+    if kind == _kString:
         prefix, body = _StringParts(text)
         if b'u' in prefix and b'r' in prefix:
             return 'invalid syntax'
@@ -144,10 +267,7 @@ def _Py3TokenError(text, kind, version):
 
 
 def _Py2TokenError(text, kind, version):
-    if kind == _kNumber:
-        if b'_' in text:
-            return 'invalid syntax'
-    elif kind == _kString:
+    if kind == _kString:
         prefix = _StringParts(text)[0]
         if b'f' in prefix or prefix.startswith(b'r') and b'b' in prefix:
             return 'invalid syntax'
@@ -156,11 +276,13 @@ def _Py2TokenError(text, kind, version):
 
 # Version -> (cheap test of a line's text, test of one token). The grammars
 # see these tokens as plain numbers, strings and the not-equal operator.
-_kPy3Hint = (br'<>|[0-9][lL]|0[xX][0-9a-fA-F]*[lL]|(?<![0-9A-Za-z_.])0[0-9]|'
-             br'[uU][rR][\'"]|\\[uUN]')
+# Numbers are checked on lines where one may be malformed: a digit before a
+# letter, '_' or '.', or a leading zero.
+_kNumberHint = br'[0-9][A-Za-z_.]|(?<![0-9A-Za-z_.])0[0-9]'
+_kPy3Hint = _kNumberHint + br'|<>|[uU][rR][\'"]|\\[uUN]'
 _kTokenChecks = {
-    '2.7': (re.compile(br'[0-9]_|[fF][rR]?[\'"]|[rR][fFbB][\'"]'), _Py2TokenError),
-    '3.5': (re.compile(_kPy3Hint + br'|[0-9]_|[fF][rRbB]?[\'"]'), _Py3TokenError),
+    '2.7': (re.compile(_kNumberHint + br'|[fF][rR]?[\'"]|[rR][fFbB][\'"]'), _Py2TokenError),
+    '3.5': (re.compile(_kPy3Hint + br'|[fF][rRbB]?[\'"]'), _Py3TokenError),
     '3.6': (re.compile(_kPy3Hint), _Py3TokenError),
     '3.7': (re.compile(_kPy3Hint), _Py3TokenError),
     '3.8': (re.compile(_kPy3Hint), _Py3TokenError),
@@ -179,7 +301,10 @@ def TokenError(version, logical):
     if hint.search(logical.fLineText):
         for i in range(logical.fTokenCount):
             text = logical.GetTokenString(i)
-            message = check(text, _fastaccess.GetTokenType(text), version)
+            kind = _fastaccess.GetTokenType(text)
+            message = check(text, kind, version)
+            if message is None and kind == _kNumber:
+                message = _NumberError(version, logical, i, text)
             if message is not None:
                 found = i, message
                 break

@@ -172,8 +172,44 @@ kNestingLimits = {
     '3.8': {'parens': 98, 'calls': 98, 'nots': 1679, 'lambdas': 839},
 }
 
+# Number literals: the message of CPython 2.7, 3.5, 3.6 and 3.7, and 3.8 (None: accepted).
+kZeros = 'leading zeros in decimal integer literals are not permitted; use an 0o prefix for octal integers'
+kBad, kSyntax = 'invalid token', 'invalid syntax'
+kNumberCases = [
+    ('x = 0777', None, kBad, kBad, kZeros),
+    ('x = 0777L', None, kBad, kBad, kZeros),
+    ('x = 09', kBad, kBad, kBad, kZeros),
+    ('x = 09.5 + 09e1 + 09j + 00', None, None, None, None),
+    ('x = 0_7', kSyntax, kSyntax, kBad, kZeros),
+    ('x = 1_000 + 0x_f + 1_0.0_1e1_0j', kSyntax, kSyntax, None, None),
+    ('x = 1__0', kSyntax, kSyntax, kBad, 'invalid decimal literal'),
+    ('x = 1_.0', kSyntax, kSyntax, kBad, 'invalid decimal literal'),
+    ('x = 6e-', kBad, kBad, kBad, 'invalid decimal literal'),
+    ('x = 1e', kSyntax, kSyntax, kSyntax, kSyntax),
+    ('x = 0o8', kBad, kBad, kBad, "invalid digit '8' in octal literal"),
+    ('x = 0b12', kSyntax, kSyntax, kSyntax, "invalid digit '2' in binary literal"),
+    ('x = 0b1_2', kSyntax, kSyntax, kBad, "invalid digit '2' in binary literal"),
+    ('x = 0xg', kBad, kBad, kBad, 'invalid hexadecimal literal'),
+    ('x = 0xL', kBad, kBad, kBad, 'invalid hexadecimal literal'),
+    ('x = 0or 1', kBad, kBad, kBad, 'invalid octal literal'),
+    ('x = 10L + 0x1fL', None, kSyntax, kSyntax, kSyntax),
+    ('x = 1.0L', kSyntax, kSyntax, kSyntax, kSyntax),
+    ('x = 1._0', kSyntax, kSyntax, kSyntax, kSyntax),
+    ('x = 0if 1else 2', None, None, None, None),
+]
+
 
 class ChecksTest(unittest.TestCase):
+
+    def testNumberLiterals(self):
+        wrong = []
+        for source, want27, want35, want36, want38 in kNumberCases:
+            for version, want in (('2.7', want27), ('3.5', want35), ('3.6', want36), ('3.7', want36),
+                                  ('3.8', want38)):
+                got = mutants.Ours(version, source.encode('utf-8') + b'\n')
+                if (got and got[0]) != want:
+                    wrong.append((version, source, want, got))
+        self.assertEqual(wrong, [])
 
     def testNestingLimits(self):
         import StringIO
