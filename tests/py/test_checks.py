@@ -122,6 +122,11 @@ kCases = [
     ('async def f(): await x', kNo, None),
     ('async def f():\n    x = [await a for a in b]', kNo, None),
     ('async def f():\n    def g(): x = [a async for a in b]', kNo, ('asynchronous comprehension outside of an asynchronous function', 2, 0)),
+    ('async def f():\n    return [[x async for x in y] for z in w]', kNo, ('asynchronous comprehension outside of an asynchronous function', 2, 0)),
+    ('async def f():\n    return [x for z in w if [a async for a in z]]', kNo, ('asynchronous comprehension outside of an asynchronous function', 2, 0)),
+    ('async def f():\n    return [(x async for x in y) for z in w]', kNo, ('asynchronous comprehension outside of an asynchronous function', 2, 0)),
+    ('async def f():\n    return [[x async for x in y] async for z in w]', kNo, None),
+    ('async def f():\n    return [x for x in [a async for a in z]]', kNo, None),
     ('def f():\n    from __future__ import division', ('from __future__ imports must occur at the beginning of the file', 2, None), ('from __future__ imports must occur at the beginning of the file', 2, 4)),
     ('from __future__ import braces', ('not a chance', 1, None), ('not a chance', 1, 0)),
     ('from __future__ import nope', ('future feature nope is not defined', 1, None), ('future feature nope is not defined', 1, 0)),
@@ -142,7 +147,9 @@ kNewIn38 = ['(a := 1)', '(f() := 1)', '(a.b := 1)', '[x := 1 for x in y]', '[y :
 # Placed where CPython does not put them: `import *` in a def (CPython points at the
 # def, another record) and 3.8's asynchronous comprehension (CPython says line 0).
 kPlacedElsewhere = ('def f():\n    from os import *\n', 'async def f():\n    def g(): x = [a async for a in b]\n',
-                    'def f():\n    return [i async for i in y]\n')
+                    'def f():\n    return [i async for i in y]\n',
+                    'async def f():\n    return [[x async for x in y] for z in w]\n',
+                    'async def f():\n    return [x for z in w if [a async for a in z]]\n')
 
 # Tokens the lexer must tell apart for the grammar: (source, versions that accept it);
 # the others say 'invalid syntax'.

@@ -322,6 +322,9 @@ struct Scope {
   std::vector<std::string> *IterVars = nullptr; ///< a comprehension's iteration variables
   bool InIterable = false;                     ///< in the iterable of a comprehension clause
   bool *Awaits = nullptr;                      ///< set when the comprehension awaits
+  /// Asynchronous comprehensions directly in this comprehension's scope: errors
+  /// unless it is asynchronous itself, which its later clauses may decide.
+  std::vector<N *> *AsyncInside = nullptr;
 };
 
 /// How CPython gives the offset of an error.
@@ -1162,6 +1165,8 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
   Inner.NoLoop = true;
   bool Awaits = false;
   Inner.Awaits = &Awaits;
+  std::vector<N *> AsyncInside;
+  Inner.AsyncInside = &AsyncInside;
   Inner.ComprehensionAt = At;
   Inner.Comprehension = List ? "list comprehension"
                              : symOf(At) != Sym::Atom || textIs(child(At, 0), "(") ? "generator expression"
@@ -1244,15 +1249,20 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
     }
     C = Next;
   }
-  // A comprehension that awaits or iterates asynchronously must be in an async
-  // def, but for a generator expression from 3.7 on.
+  // A comprehension that awaits or iterates asynchronously must be directly in
+  // an async def or in a comprehension that is asynchronous itself, but for a
+  // generator expression from 3.7 on.
+  const char *OutsideAsync = "asynchronous comprehension outside of an asynchronous function";
+  if (!(Async || Awaits))
+    for (N *Inside : AsyncInside)
+      report(kCompile, Inside, OutsideAsync, 0, Offset::LineStart);
   bool GenExp = NewScope && !List && (symOf(At) != Sym::Atom || textIs(child(At, 0), "("));
   if ((Async || Awaits) && Py3 && !(GenExp && Minor >= 7)) {
     const Scope *F = function(S);
-    while (F && F->B == Block::Comprehension)
-      F = F->Outer ? function(*F->Outer) : nullptr;
-    if (F && F->B != Block::AsyncFunction)
-      report(kCompile, At, "asynchronous comprehension outside of an asynchronous function", 0, Offset::LineStart);
+    if (F && F->B == Block::Comprehension && F->AsyncInside)
+      F->AsyncInside->push_back(At);
+    else if (F && F->B != Block::AsyncFunction)
+      report(kCompile, At, OutsideAsync, 0, Offset::LineStart);
   }
 }
 
