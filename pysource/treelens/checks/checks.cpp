@@ -49,6 +49,7 @@ enum class Sym : uint8_t {
   YieldExpr,
   NamedExpr, // test ':=' test
   Sequence, // testlist, exprlist, testlist_star_expr, testlist_safe, testlist1
+  Subscriptlist,
   ExprStmt,
   AnnAssign,
   DelStmt,
@@ -123,6 +124,7 @@ const SymName SymNames[] = {
     {"testlist_star_expr", Sym::Sequence},
     {"testlist_safe", Sym::Sequence},
     {"testlist1", Sym::Sequence},
+    {"subscriptlist", Sym::Subscriptlist},
     {"expr_stmt", Sym::ExprStmt},
     {"annassign", Sym::AnnAssign},
     {"del_stmt", Sym::DelStmt},
@@ -271,6 +273,13 @@ N *strip(N *X) {
     X = In;
   }
   return X;
+}
+
+/// The starred expression that X only wraps in parentheses, as in `(*a)`, or
+/// nullptr: the syntax tree keeps it as a starred item of what holds X.
+N *parenStarred(N *X) {
+  N *In = strip(X);
+  return In != X && symOf(In) == Sym::StarExpr ? In : nullptr;
 }
 
 /// What a subtree becomes in CPython's syntax tree, as far as the checks care.
@@ -929,6 +938,19 @@ void Checker::load(N *X, const Scope &S) {
     return load(child(X, 1), S);
   case Sym::Sequence:
     return elements(X, S, count(X) > 1);
+  case Sym::Subscriptlist: {
+    // A tuple index, which may unpack items, unless an item is a slice.
+    bool Slices = false;
+    for (Py_ssize_t I = 0; I < count(X); ++I) {
+      N *C = child(X, I);
+      if (textIs(C, ":"))
+        Slices = true;
+      else if (!isLeaf(C) && symOf(C) == Sym::Other)
+        for (Py_ssize_t J = 0; J < count(C); ++J)
+          Slices = Slices || textIs(child(C, J), ":");
+    }
+    return elements(X, S, !Slices);
+  }
   default:
     for (Py_ssize_t I = 0; I < count(X); ++I)
       load(child(X, I), S);
@@ -940,10 +962,11 @@ void Checker::load(N *X, const Scope &S) {
 void Checker::elements(N *X, const Scope &S, bool StarOk) {
   for (Py_ssize_t I = 0; I < count(X); ++I) {
     N *C = child(X, I);
-    if (symOf(C) == Sym::StarExpr) {
+    N *Star = symOf(C) == Sym::StarExpr ? C : StarOk ? parenStarred(C) : nullptr;
+    if (Star) {
       if (!StarOk)
-        starred(C, S);
-      load(child(C, 1), S);
+        starred(Star, S);
+      load(child(Star, 1), S);
     } else {
       load(C, S);
     }
@@ -999,6 +1022,8 @@ void Checker::atom(N *X, const Scope &S) {
       starred(In, S);
     return load(child(In, 1), S);
   }
+  if (N *Star = Paren ? nullptr : parenStarred(In))
+    return load(child(Star, 1), S); // [(*a)] is [*a]
   load(In, S);
 }
 
@@ -1152,6 +1177,8 @@ void Checker::call(N *Args, const Scope &S) {
     // f(x := 1): the argument holds the assignment expression's parts itself.
     if (Arg && count(A) == 3 && textIs(child(A, 1), ":="))
       namedExpr(A, S);
+    else if (N *Star = Py3 ? parenStarred(A) : nullptr)
+      load(child(Star, 1), S); // f((*a)) unpacks a as f(*a) does
     else
       load(A, S);
   }
@@ -1209,7 +1236,7 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
     }
     load(child(In, 0), CS);
     load(child(In, 2), CS);
-  } else if (symOf(Elt) == Sym::StarExpr) {
+  } else if (symOf(Elt) == Sym::StarExpr || parenStarred(Elt)) {
     report(kAst, Elt, "iterable unpacking cannot be used in comprehension");
     return;
   } else {
@@ -1574,7 +1601,8 @@ void Checker::countStars(N *X, bool Top) {
   if (K == Kind::Starred) {
     if (Top)
       report(kCompile, X, "starred assignment target must be in a list or tuple");
-    countStars(child(X, 1), false);
+    // The item a starred target unpacks into is not in a list or tuple itself.
+    countStars(child(X, 1), true);
     return;
   }
   N *Seq = sequenceOf(X, K);
@@ -1592,7 +1620,7 @@ void Checker::countStars(N *X, bool Top) {
     report(kCompile, X, "two starred expressions in assignment");
   for (Py_ssize_t I = 0; I < count(Seq); I += 2) {
     N *C = strip(child(Seq, I));
-    countStars(kindOf(C) == Kind::Starred ? child(C, 1) : C, false);
+    countStars(kindOf(C) == Kind::Starred ? child(C, 1) : C, kindOf(C) == Kind::Starred);
   }
 }
 
