@@ -150,13 +150,15 @@ kCases = [
 kNewIn38 = ['(a := 1)', '(f() := 1)', '(a.b := 1)', '[x := 1 for x in y]', '[y := 1 for x in z]', 'f(a := 1)',
             'def f(a=1, /, b): pass', 'def f(a, a, /): pass', 'def f(a, /, b): pass', 'await x', 'def f(): await x',
             'class C: [(y := 1) for x in z]', '[(x := 1) for x in y]', '[i := 0 for i, j in y]', 'del (a := 1)',
-            '[x for x in (y := z)]', 'def f():\n    return [i async for i in y]', 'def f():\n    return (i async for i in y)', 'f(a.b := 1)', 'f(a=1, b := 2)', 'return *a', 'f(True=1)', 'f((a)=1)', '[(yield) for x in y]', 'x = {(yield) for x in y}']
+            '[x for x in (y := z)]', 'def f():\n    return [i async for i in y]', 'def f():\n    return (i async for i in y)', 'f(a.b := 1)', 'f(a=1, b := 2)', 'return *a', 'f(True=1)', 'f((a)=1)', '[(yield) for x in y]', 'x = {(yield) for x in y}',
+            'l = [i async for i in g]', 'class C: l = [await x for x in y]', 'l = (i async for i in g)']
 # Placed where CPython does not put them: `import *` in a def (CPython points at the
 # def, another record) and 3.8's asynchronous comprehension (CPython says line 0).
 kPlacedElsewhere = ('def f():\n    from os import *\n', 'async def f():\n    def g(): x = [a async for a in b]\n',
                     'def f():\n    return [i async for i in y]\n',
                     'async def f():\n    return [[x async for x in y] for z in w]\n',
-                    'async def f():\n    return [x for z in w if [a async for a in z]]\n')
+                    'async def f():\n    return [x for z in w if [a async for a in z]]\n',
+                    'l = [i async for i in g]\n', 'class C: l = [await x for x in y]\n')
 
 # Tokens the lexer must tell apart for the grammar: (source, versions that accept it);
 # the others say 'invalid syntax'.

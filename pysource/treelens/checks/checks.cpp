@@ -1277,8 +1277,8 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
     C = Next;
   }
   // A comprehension that awaits or iterates asynchronously must be directly in
-  // an async def or in a comprehension that is asynchronous itself, but for a
-  // generator expression from 3.7 on.
+  // an async def or in a comprehension that is asynchronous itself (not in a
+  // module or class body), but for a generator expression from 3.7 on.
   const char *OutsideAsync = "asynchronous comprehension outside of an asynchronous function";
   if (!(Async || Awaits))
     for (N *Inside : AsyncInside)
@@ -1288,7 +1288,7 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
     const Scope *F = function(S);
     if (F && F->B == Block::Comprehension && F->AsyncInside)
       F->AsyncInside->push_back(At);
-    else if (F && F->B != Block::AsyncFunction)
+    else if (!F || F->B != Block::AsyncFunction) // a module or class body too
       report(kCompile, At, OutsideAsync, 0, Offset::LineStart);
   }
 }
