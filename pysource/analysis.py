@@ -92,10 +92,14 @@ def UsesPrintFunction(logicals):
 # ---- Tokens that a version's lexer rejects but its grammar cannot tell apart
 
 _kNumber, _kString = 2, 3
-_kEscape = re.compile(br'\\(.)', re.S)
-_kHex4, _kHex8 = re.compile(br'[0-9a-fA-F]{4}'), re.compile(br'[0-9a-fA-F]{8}')
-_kNamedEscape = re.compile(br'\{[^{}\\\'"]+\}')
 _kTripleQuotes = (b'"' * 3, b"'" * 3)
+_kNonAscii = re.compile(br'[\x80-\xff]')
+# A character that Python 3 passes to the escape decoder as a \U escape of ten
+# bytes: a UTF-8 sequence (or a byte that starts none), or a backslash before one.
+_kUtf8Char = re.compile(br'\\(?=[\x80-\xff])|[\xc0-\xdf][\x80-\xbf]|[\xe0-\xef][\x80-\xbf]{2}|'
+                        br'[\xf0-\xf7][\x80-\xbf]{3}|[\x80-\xff]')
+# Messages of string decoding, which CPython reports once the line has parsed.
+_kDecodingMessages = ('(unicode error)', '(value error)', 'bytes can only contain ASCII')
 
 
 def _StringParts(text):
@@ -105,23 +109,102 @@ def _StringParts(text):
     return text[:quote].lower(), text[quote + q:len(text) - q]
 
 
-def _BadUnicodeEscape(body):
-    """The message for the first \\u, \\U or \\N escape Python 3 cannot decode, or None."""
-    for m in _kEscape.finditer(body):
-        c, end = m.group(1), m.end()
-        if c == b'u' and not _kHex4.match(body, end):
-            return "(unicode error) 'unicodeescape' codec can't decode: truncated \\uXXXX escape"
-        if c == b'U' and not _kHex8.match(body, end):
-            return ("(unicode error) 'unicodeescape' codec can't decode: "
-                    "truncated \\UXXXXXXXX escape")
-        if c == b'N' and not _kNamedEscape.match(body, end):
-            return ("(unicode error) 'unicodeescape' codec can't decode: "
-                    "malformed \\N character escape")
+def _DecodeError(codec, buf, start, end, reason):
+    """A decoder's message for the bytes buf[start:end]."""
+    if end - start == 1:
+        where = "byte 0x%02x in position %d" % (ord(buf[start:end]), start)
+    else:
+        where = 'bytes in position %d-%d' % (start, end - 1)
+    return "(unicode error) '%s' codec can't decode %s: %s" % (codec, where, reason)
+
+
+def _HexRun(buf, i, count):
+    """The end of the run of at most count hex digits at buf[i:]."""
+    end = i
+    while end < len(buf) and end - i < count and buf[end:end + 1] in _kHexDigitBytes:
+        end += 1
+    return end
+
+
+def _TextEscapeError(body, python3):
+    """The message for the first escape of a text string body that the
+    unicodeescape decoder rejects, or None. Python 3 hands it each non-ASCII
+    character as a \\U escape, which moves the positions it reports; 2.7
+    (u'') hands it the bytes and also looks names up (its own Unicode data).
+    """
+    if python3 and _kNonAscii.search(body):
+        body = _kUtf8Char.sub(lambda m: b'\\u005c' if m.group() == b'\\' else b'\\U00000000', body)
+    n, i = len(body), body.find(b'\\')
+    while 0 <= i < n - 1:
+        start, c = i, body[i + 1:i + 2]
+        i += 2
+        count = {b'x': 2, b'u': 4, b'U': 8}.get(c)
+        if count:
+            end = _HexRun(body, i, count)
+            if end - i < count:
+                names = {2: 'xXX', 4: 'uXXXX', 8: 'UXXXXXXXX'}
+                return _DecodeError('unicodeescape', body, start, end,
+                                    'truncated \\%s escape' % names[count])
+            if count == 8 and int(body[i:end], 16) > 0x10FFFF:
+                return _DecodeError('unicodeescape', body, start, end, 'illegal Unicode character')
+            i = end
+        elif c == b'N':
+            # \\N{name}: without the braces or a name, the escape ends where that is found missing.
+            close = body.find(b'}', i + 1) if body[i:i + 1] == b'{' else i
+            if close <= i + 1:
+                end = n if close < 0 else close
+                return _DecodeError('unicodeescape', body, start, end, 'malformed \\N character escape')
+            if not python3 and not _UnicodeNameExists(body[i + 1:close]):
+                return _DecodeError('unicodeescape', body, start, close + 1,
+                                    'unknown Unicode character name')
+            i = close + 1
+        i = body.find(b'\\', i)
+    return None
+
+
+def _UnicodeNameExists(name):
+    import unicodedata
+    try:
+        unicodedata.lookup(name)
+        return True
+    except (KeyError, UnicodeDecodeError):
+        return False
+
+
+def _RawUnicodeEscapeError(body):
+    """2.7's rawunicodeescape decoder (ur''): an odd run of backslashes before
+    u or U starts an escape of four or eight hex digits."""
+    n, i = len(body), body.find(b'\\')
+    while 0 <= i < n:
+        start = i
+        while body[i:i + 1] == b'\\':
+            i += 1
+        c = body[i:i + 1]
+        if (i - start) % 2 and c in (b'u', b'U'):
+            count = 4 if c == b'u' else 8
+            end = _HexRun(body, i + 1, count)
+            if end - i - 1 < count:
+                return _DecodeError('rawunicodeescape', body, start, end, 'truncated \\uXXXX')
+            if count == 8 and int(body[i + 1:end], 16) > 0x10FFFF:
+                return _DecodeError('rawunicodeescape', body, start, end, '\\Uxxxxxxxx out of range')
+            i = end
+        i = body.find(b'\\', i)
+    return None
+
+
+def _BytesEscapeError(body):
+    """Python 3's message for a \\x escape of a bytes body without two hex digits."""
+    i = body.find(b'\\')
+    while 0 <= i < len(body) - 1:
+        if body[i + 1:i + 2] == b'x' and _HexRun(body, i + 2, 2) < i + 4:
+            return '(value error) invalid \\x escape at position %d' % i
+        i = body.find(b'\\', i + 2)
     return None
 
 
 _kDigits = frozenset(b'0123456789')
 _kHexDigits = frozenset(b'0123456789abcdefABCDEF')
+_kHexDigitBytes = frozenset(c for c in _kHexDigits)
 _kOctDigits = frozenset(b'01234567')
 _kBinDigits = frozenset(b'01')
 # Messages of 3.8's number lexer; the older ones say 'invalid token' for each.
@@ -259,8 +342,13 @@ def _Py3TokenError(text, kind, version):
             return 'invalid syntax'
         if version == '3.5' and b'f' in prefix:
             return 'invalid syntax'
-        if b'b' not in prefix and b'r' not in prefix and b'\\' in body:
-            return _BadUnicodeEscape(body)
+        if b'b' in prefix:
+            if _kNonAscii.search(body):
+                return 'bytes can only contain ASCII literal characters.'
+            if b'r' not in prefix and b'\\' in body:
+                return _BytesEscapeError(body)
+        elif b'r' not in prefix and b'\\' in body:
+            return _TextEscapeError(body, True)
     elif text == b'<>':
         return 'invalid syntax'
     return None
@@ -268,9 +356,11 @@ def _Py3TokenError(text, kind, version):
 
 def _Py2TokenError(text, kind, version):
     if kind == _kString:
-        prefix = _StringParts(text)[0]
+        prefix, body = _StringParts(text)
         if b'f' in prefix or prefix.startswith(b'r') and b'b' in prefix:
             return 'invalid syntax'
+        if b'u' in prefix and b'\\' in body:
+            return _RawUnicodeEscapeError(body) if b'r' in prefix else _TextEscapeError(body, False)
     return None
 
 
@@ -279,9 +369,9 @@ def _Py2TokenError(text, kind, version):
 # Numbers are checked on lines where one may be malformed: a digit before a
 # letter, '_' or '.', or a leading zero.
 _kNumberHint = br'[0-9][A-Za-z_.]|(?<![0-9A-Za-z_.])0[0-9]'
-_kPy3Hint = _kNumberHint + br'|<>|[uU][rR][\'"]|\\[uUN]'
+_kPy3Hint = _kNumberHint + br'|<>|[uU][rR][\'"]|\\[xuUN]|[\x80-\xff]'
 _kTokenChecks = {
-    '2.7': (re.compile(_kNumberHint + br'|[fF][rR]?[\'"]|[rR][fFbB][\'"]'), _Py2TokenError),
+    '2.7': (re.compile(_kNumberHint + br'|[fF][rR]?[\'"]|[rR][fFbB][\'"]|\\[xuUN]'), _Py2TokenError),
     '3.5': (re.compile(_kPy3Hint + br'|[fF][rRbB]?[\'"]'), _Py3TokenError),
     '3.6': (re.compile(_kPy3Hint), _Py3TokenError),
     '3.7': (re.compile(_kPy3Hint), _Py3TokenError),
@@ -387,7 +477,7 @@ def _LexedFirst(logical, found, error):
     if hasattr(error, 'column'):          # an error of the checks after parsing
         # but for '<>' under 3.x, which they place past the token as CPython does
         return error.msg != 'invalid syntax' or (row + 1, col + 1) < (error.lineno, error.column - 1)
-    if found[1].startswith('(unicode error)'):
+    if found[1].startswith(_kDecodingMessages):
         return False
     return (row + 1, col + 1) <= (error.lineno, error.offset)
 
@@ -440,6 +530,12 @@ class VersionAnalyzer(object):
                 from pysource import treelens
                 _fastaccess.ClearLogicalDerivedInfo(logical)
                 error = treelens.CreateSyntaxError(found[1], logical, found[0])
+                if found[1].startswith(_kDecodingMessages):
+                    # Found once the line has parsed: CPython gives the string's
+                    # offset as for the checks after parsing.
+                    error.column = error.offset
+                    error.offset = (None if not self._py3 else
+                                    error.offset - 1 if self._triple < (3, 8) else error.offset)
         if error is not None and self.checks and self._py3:
             error = _LegacyStatementError(self.version, logical, error)
         return error

@@ -214,8 +214,39 @@ kNumberCases = [
     ('x = 0if 1else 2', None, None, None, None),
 ]
 
+# String literals the decoders reject: the message of CPython 2.7 and of 3.5 to 3.8.
+kDecode = "(unicode error) 'unicodeescape' codec can't decode bytes in position "
+kStringCases = [
+    (u"x = '\xe9\\u12'", None, kDecode + '10-13: truncated \\uXXXX escape'),
+    (u"x = 'a\\\xe9\\x1'", kNo, kDecode + '17-19: truncated \\xXX escape'),
+    (u"x = '\\N{'", None, kDecode + '0-2: malformed \\N character escape'),
+    (u"x = '\\U00110000'", None, kDecode + '0-9: illegal Unicode character'),
+    (u"x = u'\\N{EM DASH}\\N{NOPE}'", kDecode + '11-18: unknown Unicode character name', kNo),
+    (u"x = u'\\N{EM DASH}' + '\\N{EM DASH}'", None, None),
+    (u"x = ur'\\\\u12 \\u12'",
+     "(unicode error) 'rawunicodeescape' codec can't decode bytes in position 6-9: truncated \\uXXXX", kSyntax),
+    (u"x = b'\\x1g'", kNo, '(value error) invalid \\x escape at position 0'),
+    (u"x = br'\xe9'", None, 'bytes can only contain ASCII literal characters.'),
+    (u"x = rb'\\x' + r'\\u12' + b'\\\\x'", kSyntax, None),
+]
+
 
 class ChecksTest(unittest.TestCase):
+
+    def testStringLiterals(self):
+        wrong = []
+        for source, want27, want3 in kStringCases:
+            for version in analysis.kVersions:
+                want = want27 if version == '2.7' else want3
+                if want == kNo:
+                    continue
+                got = mutants.Ours(version, source.encode('utf-8') + b'\n')
+                if (got and got[0]) != want:
+                    wrong.append((version, source, want, got))
+        self.assertEqual(wrong, [])
+        # Found after parsing, they have CPython's offset of the string (none under 2.7).
+        for version, offset in (('2.7', None), ('3.6', 4), ('3.8', 5)):
+            self.assertEqual(mutants.Ours(version, b"x = u'\\u12'\n")[1:], [1, offset])
 
     def testNumberLiterals(self):
         wrong = []
