@@ -366,9 +366,11 @@ def _Py2TokenError(text, kind, version):
 
 # Version -> (cheap test of a line's text, test of one token). The grammars
 # see these tokens as plain numbers, strings and the not-equal operator.
-# Numbers are checked on lines where one may be malformed: a digit before a
-# letter, '_' or '.', or a leading zero.
-_kNumberHint = br'[0-9][A-Za-z_.]|(?<![0-9A-Za-z_.])0[0-9]'
+# Numbers are checked on lines where one may be malformed: a leading zero
+# before a digit, '_' or a prefix; an underscore or a long suffix; an exponent
+# without digits (also right after a j, which ends a number).
+_kNumberHint = (br'(?<![A-IK-Za-ik-z_0-9.])(?:0[0-9_xXoObBlL]|\.?[0-9][0-9._]*(?:[eE][+-]?[0-9._]*)?[_lL]|'
+                br'\.?[0-9][0-9.]*[eE][+-]?(?![0-9]))')
 _kPy3Hint = _kNumberHint + br'|<>|[uU][rR][\'"]|\\[xuUN]|[\x80-\xff]'
 _kTokenChecks = {
     '2.7': (re.compile(_kNumberHint + br'|[fF][rR]?[\'"]|[rR][fFbB][\'"]|\\[xuUN]'), _Py2TokenError),
