@@ -92,6 +92,7 @@ def UsesPrintFunction(logicals):
 # ---- Tokens that a version's lexer rejects but its grammar cannot tell apart
 
 _kNumber, _kString = 2, 3
+_kCheckedKinds = (_kNumber, _kString, 29)   # 29: '<>' and '!='
 _kTripleQuotes = (b'"' * 3, b"'" * 3)
 _kNonAscii = re.compile(br'[\x80-\xff]')
 # A character that Python 3 passes to the escape decoder as a \U escape of ten
@@ -324,12 +325,12 @@ def _NumberEnd(version, text):
     return Long(i), None
 
 
-def _NumberError(version, logical, index, text):
-    """The message for a number token the version's lexer rejects or ends
+def _NumberError(version, position, text, lines):
+    """The message for a number token at position (row, col) of lines (the
+    physical lines of its record) that the version's lexer rejects or ends
     early (the rest is then a name the grammar does not take), or None."""
-    row, col = logical.fTokens[index][1]
-    line = logical.fLineText.splitlines(True)[row]
-    end, message = _NumberEnd(version, line[col:])
+    row, col = position
+    end, message = _NumberEnd(version, lines[row][col:])
     if message is None and end < len(text):
         message = 'invalid syntax'
     return message
@@ -368,12 +369,17 @@ def _Py2TokenError(text, kind, version):
 # see these tokens as plain numbers, strings and the not-equal operator.
 # Numbers are checked on lines where one may be malformed: a leading zero
 # before a digit, '_' or a prefix; an underscore or a long suffix; an exponent
-# without digits (also right after a j, which ends a number).
-_kNumberHint = (br'(?<![A-IK-Za-ik-z_0-9.])(?:0[0-9_xXoObBlL]|\.?[0-9][0-9._]*(?:[eE][+-]?[0-9._]*)?[_lL]|'
-                br'\.?[0-9][0-9.]*[eE][+-]?(?![0-9]))')
+# without digits. The first digit or '.' of the number (not inside a name or
+# another number, but right after a j, which ends a number) leads, which is
+# the fastest form for the regular expression engine.
+_kNumberHint = (br'[0-9.](?<![A-IK-Za-ik-z_0-9.][0-9.])(?:'
+                br'(?<=0)[0-9_xXoObBlL]|'
+                br'(?:(?<=\.)[0-9]|(?<=[0-9]))[0-9._]*(?:[eE][+-]?[0-9._]*)?[_lL]|'
+                br'(?:(?<=\.)[0-9]|(?<=[0-9]))[0-9.]*[eE][+-]?(?![0-9]))')
 _kPy3Hint = _kNumberHint + br'|<>|[uU][rR][\'"]|\\[xuUN]|[\x80-\xff]'
 _kTokenChecks = {
-    '2.7': (re.compile(_kNumberHint + br'|[fF][rR]?[\'"]|[rR][fFbB][\'"]|\\[xuUN]'), _Py2TokenError),
+    '2.7': (re.compile(_kNumberHint + br'|[fF][rR]?[\'"]|[rR][fFbB][\'"]|[uU][rR]?[\'"][\s\S]*\\[xuUN]'),
+            _Py2TokenError),
     '3.5': (re.compile(_kPy3Hint + br'|[fF][rRbB]?[\'"]'), _Py3TokenError),
     '3.6': (re.compile(_kPy3Hint), _Py3TokenError),
     '3.7': (re.compile(_kPy3Hint), _Py3TokenError),
@@ -382,21 +388,28 @@ _kTokenChecks = {
 
 
 def TokenError(version, logical):
-    """(token index, message) of the first token the version's lexer rejects, or None.
+    """(token index, message) of the first token the version's lexer or string
+    decoding rejects, or None.
 
-    Python 3 rejects long literals (10L), old octals (0777), ur'' strings, <>
-    and \\u escapes that are not four hex digits in text strings; 3.5 also
-    f-strings and underscores in numbers; 2.7 rejects those two and rb''.
+    Python 3 rejects long literals (10L), ur'' strings, <>, bytes that are not
+    ASCII and escapes its decoders cannot decode; 3.5 also f-strings and
+    underscores in numbers; 2.7 rejects those two, rb'' and bad escapes of u''
+    strings. Number literals are read as each version's lexer reads them.
     """
     found = None
     hint, check = _kTokenChecks[version]
     if hint.search(logical.fLineText):
+        lines = None
         for i in range(logical.fTokenCount):
+            kind = _fastaccess.GetLogicalTokenType(logical, i)
+            if kind not in _kCheckedKinds:
+                continue
             text = logical.GetTokenString(i)
-            kind = _fastaccess.GetTokenType(text)
             message = check(text, kind, version)
             if message is None and kind == _kNumber:
-                message = _NumberError(version, logical, i, text)
+                if lines is None:
+                    lines = logical.fLineText.splitlines(True)
+                message = _NumberError(version, logical.fTokens[i][1], text, lines)
             if message is not None:
                 found = i, message
                 break
