@@ -122,7 +122,7 @@ def _DecodeError(codec, buf, start, end, reason):
 def _HexRun(buf, i, count):
     """The end of the run of at most count hex digits at buf[i:]."""
     end = i
-    while end < len(buf) and end - i < count and buf[end:end + 1] in _kHexDigitBytes:
+    while end < len(buf) and end - i < count and buf[end:end + 1] in _kHexDigits:
         end += 1
     return end
 
@@ -150,7 +150,7 @@ def _TextEscapeError(body, python3):
                 return _DecodeError('unicodeescape', body, start, end, 'illegal Unicode character')
             i = end
         elif c == b'N':
-            # \\N{name}: without the braces or a name, the escape ends where that is found missing.
+            # \N{name}: without the braces or a name, the escape ends where that is found missing.
             close = body.find(b'}', i + 1) if body[i:i + 1] == b'{' else i
             if close <= i + 1:
                 end = n if close < 0 else close
@@ -164,6 +164,7 @@ def _TextEscapeError(body, python3):
 
 
 def _UnicodeNameExists(name):
+    """Whether 2.7's Unicode data (the judge's own) names a character so."""
     import unicodedata
     try:
         unicodedata.lookup(name)
@@ -205,7 +206,6 @@ def _BytesEscapeError(body):
 
 _kDigits = frozenset(b'0123456789')
 _kHexDigits = frozenset(b'0123456789abcdefABCDEF')
-_kHexDigitBytes = frozenset(c for c in _kHexDigits)
 _kOctDigits = frozenset(b'01234567')
 _kBinDigits = frozenset(b'01')
 # Messages of 3.8's number lexer; the older ones say 'invalid token' for each.
