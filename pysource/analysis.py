@@ -93,12 +93,15 @@ def UsesPrintFunction(logicals):
 # ---- Tokens that a version's lexer rejects but its grammar cannot tell apart
 
 _kNumber, _kString = 2, 3
-_kPy2Long = re.compile(br'(?:0[xX][0-9a-fA-F]+|0[oObB]?[0-9]+|[0-9]+)[lL]\Z')
-_kPy2Octal = re.compile(br'0[0-9]*[1-9][0-9]*\Z')
-_kEscape = re.compile(br'\\(.)', re.S)
-_kHex4, _kHex8 = re.compile(br'[0-9a-fA-F]{4}'), re.compile(br'[0-9a-fA-F]{8}')
-_kNamedEscape = re.compile(br'\{[^{}\\\'"]+\}')
+_kCheckedKinds = (_kNumber, _kString, 29)   # 29: '<>' and '!='
 _kTripleQuotes = (b'"' * 3, b"'" * 3)
+_kNonAscii = re.compile(br'[\x80-\xff]')
+# A character that Python 3 passes to the escape decoder as a \U escape of ten
+# bytes: a UTF-8 sequence (or a byte that starts none), or a backslash before one.
+_kUtf8Char = re.compile(br'\\(?=[\x80-\xff])|[\xc0-\xdf][\x80-\xbf]|[\xe0-\xef][\x80-\xbf]{2}|'
+                        br'[\xf0-\xf7][\x80-\xbf]{3}|[\x80-\xff]')
+# Messages of string decoding, which CPython reports once the line has parsed.
+_kDecodingMessages = ('(unicode error)', '(value error)', 'bytes can only contain ASCII')
 
 
 def _StringParts(text):
@@ -108,60 +111,277 @@ def _StringParts(text):
     return text[:quote].lower(), text[quote + q:len(text) - q]
 
 
-def _BadUnicodeEscape(body):
-    """The message for the first \\u, \\U or \\N escape Python 3 cannot decode, or None."""
-    for m in _kEscape.finditer(body):
-        c, end = m.group(1), m.end()
-        if c == b'u' and not _kHex4.match(body, end):
-            return "(unicode error) 'unicodeescape' codec can't decode: truncated \\uXXXX escape"
-        if c == b'U' and not _kHex8.match(body, end):
-            return ("(unicode error) 'unicodeescape' codec can't decode: "
-                    "truncated \\UXXXXXXXX escape")
-        if c == b'N' and not _kNamedEscape.match(body, end):
-            return ("(unicode error) 'unicodeescape' codec can't decode: "
-                    "malformed \\N character escape")
+def _DecodeError(codec, buf, start, end, reason):
+    """A decoder's message for the bytes buf[start:end]."""
+    if end - start == 1:
+        where = "byte 0x%02x in position %d" % (ord(buf[start:end]), start)
+    else:
+        where = 'bytes in position %d-%d' % (start, end - 1)
+    return "(unicode error) '%s' codec can't decode %s: %s" % (codec, where, reason)
+
+
+def _HexRun(buf, i, count):
+    """The end of the run of at most count hex digits at buf[i:]."""
+    end = i
+    while end < len(buf) and end - i < count and buf[end:end + 1] in _kHexDigits:
+        end += 1
+    return end
+
+
+def _TextEscapeError(body, python3):
+    """The message for the first escape of a text string body that the
+    unicodeescape decoder rejects, or None. Python 3 hands it each non-ASCII
+    character as a \\U escape, which moves the positions it reports; 2.7
+    (u'') hands it the bytes and also looks names up (its own Unicode data).
+    """
+    if python3 and _kNonAscii.search(body):
+        body = _kUtf8Char.sub(lambda m: b'\\u005c' if m.group() == b'\\' else b'\\U00000000', body)
+    n, i = len(body), body.find(b'\\')
+    while 0 <= i < n - 1:
+        start, c = i, body[i + 1:i + 2]
+        i += 2
+        count = {b'x': 2, b'u': 4, b'U': 8}.get(c)
+        if count:
+            end = _HexRun(body, i, count)
+            if end - i < count:
+                names = {2: 'xXX', 4: 'uXXXX', 8: 'UXXXXXXXX'}
+                return _DecodeError('unicodeescape', body, start, end,
+                                    'truncated \\%s escape' % names[count])
+            if count == 8 and int(body[i:end], 16) > 0x10FFFF:
+                return _DecodeError('unicodeescape', body, start, end, 'illegal Unicode character')
+            i = end
+        elif c == b'N':
+            # \N{name}: without the braces or a name, the escape ends where that is found missing.
+            close = body.find(b'}', i + 1) if body[i:i + 1] == b'{' else i
+            if close <= i + 1:
+                end = n if close < 0 else close
+                return _DecodeError('unicodeescape', body, start, end, 'malformed \\N character escape')
+            if not python3 and not _UnicodeNameExists(body[i + 1:close]):
+                return _DecodeError('unicodeescape', body, start, close + 1,
+                                    'unknown Unicode character name')
+            i = close + 1
+        i = body.find(b'\\', i)
     return None
 
 
+def _UnicodeNameExists(name):
+    """Whether 2.7's Unicode data (the judge's own) names a character so."""
+    import unicodedata
+    try:
+        unicodedata.lookup(name)
+        return True
+    except (KeyError, UnicodeDecodeError):
+        return False
+
+
+def _RawUnicodeEscapeError(body):
+    """2.7's rawunicodeescape decoder (ur''): an odd run of backslashes before
+    u or U starts an escape of four or eight hex digits."""
+    n, i = len(body), body.find(b'\\')
+    while 0 <= i < n:
+        start = i
+        while body[i:i + 1] == b'\\':
+            i += 1
+        c = body[i:i + 1]
+        if (i - start) % 2 and c in (b'u', b'U'):
+            count = 4 if c == b'u' else 8
+            end = _HexRun(body, i + 1, count)
+            if end - i - 1 < count:
+                return _DecodeError('rawunicodeescape', body, start, end, 'truncated \\uXXXX')
+            if count == 8 and int(body[i + 1:end], 16) > 0x10FFFF:
+                return _DecodeError('rawunicodeescape', body, start, end, '\\Uxxxxxxxx out of range')
+            i = end
+        i = body.find(b'\\', i)
+    return None
+
+
+def _BytesEscapeError(body):
+    """Python 3's message for a \\x escape of a bytes body without two hex digits."""
+    i = body.find(b'\\')
+    while 0 <= i < len(body) - 1:
+        if body[i + 1:i + 2] == b'x' and _HexRun(body, i + 2, 2) < i + 4:
+            return '(value error) invalid \\x escape at position %d' % i
+        i = body.find(b'\\', i + 2)
+    return None
+
+
+_kDigits = frozenset(b'0123456789')
+_kHexDigits = frozenset(b'0123456789abcdefABCDEF')
+_kOctDigits = frozenset(b'01234567')
+_kBinDigits = frozenset(b'01')
+# Messages of 3.8's number lexer; the older ones say 'invalid token' for each.
+_kLeadingZeros = ('leading zeros in decimal integer literals are not permitted; '
+                  'use an 0o prefix for octal integers')
+
+
+def _NumberEnd(version, text):
+    """Where the version's lexer ends the number that `text` (a NUMBER token and
+    what follows it on its line) begins with: (end, None), or (None, message)
+    when the lexer rejects it."""
+    py3, underscores = version != '2.7', version not in ('2.7', '3.5')
+    new_messages = version >= '3.8'
+    n = len(text)
+
+    def At(i):
+        return text[i:i + 1]
+
+    def Fail(message):
+        return None, message if new_messages else 'invalid token'
+
+    def BadDigit(i, name):
+        # 3.8 names a decimal digit that an octal or binary literal cannot hold.
+        if new_messages and name in ('octal', 'binary') and i < n and At(i) in _kDigits:
+            return Fail("invalid digit '%s' in %s literal" % (At(i), name))
+        return Fail('invalid %s literal' % name)
+
+    def Digits(i, digits, name='decimal'):
+        # i is at a first digit; returns the end of the digit run, or a failure.
+        while True:
+            while i < n and At(i) in digits:
+                i += 1
+            if not (underscores and At(i) == b'_'):
+                return i, None
+            i += 1
+            if not (i < n and At(i) in digits):
+                return BadDigit(i, name)
+
+    def Tail(i):
+        # After the integer part: a fraction, an exponent, an imaginary suffix.
+        if At(i) == b'.':
+            i += 1
+            if i < n and At(i) in _kDigits:
+                i, failed = Digits(i, _kDigits)
+                if failed:
+                    return None, failed
+        if At(i) in (b'e', b'E'):
+            j = i + 1
+            sign = At(j) in (b'+', b'-')
+            if sign:
+                j += 1
+            if not (j < n and At(j) in _kDigits):
+                if sign:
+                    return Fail('invalid decimal literal')
+                return i, None            # '1e' is the number 1 and the name e
+            i, failed = Digits(j, _kDigits)
+            if failed:
+                return None, failed
+        if At(i) in (b'j', b'J'):
+            i += 1
+        return i, None
+
+    def Long(i):
+        return i + 1 if not py3 and At(i) in (b'l', b'L') else i
+
+    if At(0) == b'.':
+        return Tail(0)
+    if At(0) != b'0':
+        i, failed = Digits(0, _kDigits)
+        if failed:
+            return None, failed
+        if not py3 and At(i) in (b'l', b'L'):
+            return i + 1, None
+        return Tail(i)
+    prefix = At(1).lower()
+    for letter, digits, name in ((b'x', _kHexDigits, 'hexadecimal'), (b'o', _kOctDigits, 'octal'),
+                                 (b'b', _kBinDigits, 'binary')):
+        if prefix != letter:
+            continue
+        i = 2
+        if underscores and At(i) == b'_':
+            i += 1
+        if not (i < n and At(i) in digits):
+            return BadDigit(i, name)
+        i, failed = Digits(i, digits, name)
+        if failed:
+            return None, failed
+        if new_messages and name != 'hexadecimal' and i < n and At(i) in _kDigits:
+            return BadDigit(i, name)
+        return Long(i), None
+    # A decimal number with a leading zero: zeros only, or a float.
+    i = 1
+    if py3:
+        while True:
+            if underscores and At(i) == b'_':
+                i += 1
+                if not (i < n and At(i) in _kDigits):
+                    return Fail('invalid decimal literal')
+            if At(i) != b'0':
+                break
+            i += 1
+        nonzero = i < n and At(i) in _kDigits
+        if nonzero:
+            i, failed = Digits(i, _kDigits)
+            if failed:
+                return None, failed
+    else:
+        while i < n and At(i) in _kOctDigits:
+            i += 1
+        nonzero = i < n and At(i) in _kDigits
+        while i < n and At(i) in _kDigits:
+            i += 1
+    if At(i) in (b'.', b'e', b'E', b'j', b'J'):
+        return Tail(i)
+    if nonzero:
+        return Fail(_kLeadingZeros)
+    return Long(i), None
+
+
+def _NumberError(version, position, text, lines):
+    """The message for a number token at position (row, col) of lines (the
+    physical lines of its record) that the version's lexer rejects or ends
+    early (the rest is then a name the grammar does not take), or None."""
+    row, col = position
+    end, message = _NumberEnd(version, lines[row][col:])
+    if message is None and end < len(text):
+        message = 'invalid syntax'
+    return message
+
+
 def _Py3TokenError(text, kind, version):
-    if kind == _kNumber:
-        if _kPy2Long.match(text):
-            return 'invalid syntax'
-        if _kPy2Octal.match(text):
-            return 'invalid token'
-        if version == '3.5' and b'_' in text:
-            return 'invalid syntax'
-    elif kind == _kString:
+    if kind == _kString:
         prefix, body = _StringParts(text)
         if b'u' in prefix and b'r' in prefix:
             return 'invalid syntax'
         if version == '3.5' and b'f' in prefix:
             return 'invalid syntax'
-        if b'b' not in prefix and b'r' not in prefix and b'\\' in body:
-            return _BadUnicodeEscape(body)
+        if b'b' in prefix:
+            if _kNonAscii.search(body):
+                return 'bytes can only contain ASCII literal characters.'
+            if b'r' not in prefix and b'\\' in body:
+                return _BytesEscapeError(body)
+        elif b'r' not in prefix and b'\\' in body:
+            return _TextEscapeError(body, True)
     elif text == b'<>':
         return 'invalid syntax'
     return None
 
 
 def _Py2TokenError(text, kind, version):
-    if kind == _kNumber:
-        if b'_' in text:
-            return 'invalid syntax'
-    elif kind == _kString:
-        prefix = _StringParts(text)[0]
+    if kind == _kString:
+        prefix, body = _StringParts(text)
         if b'f' in prefix or prefix.startswith(b'r') and b'b' in prefix:
             return 'invalid syntax'
+        if b'u' in prefix and b'\\' in body:
+            return _RawUnicodeEscapeError(body) if b'r' in prefix else _TextEscapeError(body, False)
     return None
 
 
 # Version -> (cheap test of a line's text, test of one token). The grammars
 # see these tokens as plain numbers, strings and the not-equal operator.
-_kPy3Hint = (br'<>|[0-9][lL]|0[xX][0-9a-fA-F]*[lL]|(?<![0-9A-Za-z_.])0[0-9]|'
-             br'[uU][rR][\'"]|\\[uUN]')
+# Numbers are checked on lines where one may be malformed: a leading zero
+# before a digit, '_' or a prefix; an underscore or a long suffix; an exponent
+# without digits. The first digit or '.' of the number (not inside a name or
+# another number, but right after a j, which ends a number) leads, which is
+# the fastest form for the regular expression engine.
+_kNumberHint = (br'[0-9.](?<![A-IK-Za-ik-z_0-9.][0-9.])(?:'
+                br'(?<=0)[0-9_xXoObBlL]|'
+                br'(?:(?<=\.)[0-9]|(?<=[0-9]))[0-9._]*(?:[eE][+-]?[0-9._]*)?[_lL]|'
+                br'(?:(?<=\.)[0-9]|(?<=[0-9]))[0-9.]*[eE][+-]?(?![0-9]))')
+_kPy3Hint = _kNumberHint + br'|<>|[uU][rR][\'"]|\\[xuUN]|[\x80-\xff]'
 _kTokenChecks = {
-    '2.7': (re.compile(br'[0-9]_|[fF][rR]?[\'"]|[rR][fFbB][\'"]'), _Py2TokenError),
-    '3.5': (re.compile(_kPy3Hint + br'|[0-9]_|[fF][rRbB]?[\'"]'), _Py3TokenError),
+    '2.7': (re.compile(_kNumberHint + br'|[fF][rR]?[\'"]|[rR][fFbB][\'"]|[uU][rR]?[\'"][\s\S]*\\[xuUN]'),
+            _Py2TokenError),
+    '3.5': (re.compile(_kPy3Hint + br'|[fF][rRbB]?[\'"]'), _Py3TokenError),
     '3.6': (re.compile(_kPy3Hint), _Py3TokenError),
     '3.7': (re.compile(_kPy3Hint), _Py3TokenError),
     '3.8': (re.compile(_kPy3Hint), _Py3TokenError),
@@ -169,18 +389,28 @@ _kTokenChecks = {
 
 
 def TokenError(version, logical):
-    """(token index, message) of the first token the version's lexer rejects, or None.
+    """(token index, message) of the first token the version's lexer or string
+    decoding rejects, or None.
 
-    Python 3 rejects long literals (10L), old octals (0777), ur'' strings, <>
-    and \\u escapes that are not four hex digits in text strings; 3.5 also
-    f-strings and underscores in numbers; 2.7 rejects those two and rb''.
+    Python 3 rejects long literals (10L), ur'' strings, <>, bytes that are not
+    ASCII and escapes its decoders cannot decode; 3.5 also f-strings and
+    underscores in numbers; 2.7 rejects those two, rb'' and bad escapes of u''
+    strings. Number literals are read as each version's lexer reads them.
     """
     found = None
     hint, check = _kTokenChecks[version]
     if hint.search(logical.fLineText):
+        lines = None
         for i in range(logical.fTokenCount):
+            kind = _fastaccess.GetLogicalTokenType(logical, i)
+            if kind not in _kCheckedKinds:
+                continue
             text = logical.GetTokenString(i)
-            message = check(text, _fastaccess.GetTokenType(text), version)
+            message = check(text, kind, version)
+            if message is None and kind == _kNumber:
+                if lines is None:
+                    lines = logical.fLineText.splitlines(True)
+                message = _NumberError(version, logical.fTokens[i][1], text, lines)
             if message is not None:
                 found = i, message
                 break
@@ -263,7 +493,7 @@ def _LexedFirst(logical, found, error):
     if hasattr(error, 'column'):          # an error of the checks after parsing
         # but for '<>' under 3.x, which they place past the token as CPython does
         return error.msg != 'invalid syntax' or (row + 1, col + 1) < (error.lineno, error.column - 1)
-    if found[1].startswith('(unicode error)'):
+    if found[1].startswith(_kDecodingMessages):
         return False
     return (row + 1, col + 1) <= (error.lineno, error.offset)
 
@@ -316,6 +546,12 @@ class VersionAnalyzer(object):
                 from pysource import treelens
                 _fastaccess.ClearLogicalDerivedInfo(logical)
                 error = treelens.CreateSyntaxError(found[1], logical, found[0])
+                if found[1].startswith(_kDecodingMessages):
+                    # Found once the line has parsed: CPython gives the string's
+                    # offset as for the checks after parsing.
+                    error.column = error.offset
+                    error.offset = (None if not self._py3 else
+                                    error.offset - 1 if self._triple < (3, 8) else error.offset)
         if error is not None and self.checks and self._py3:
             error = _LegacyStatementError(self.version, logical, error)
         return error

@@ -18,19 +18,24 @@ enum class Status {
   BadInput,     ///< the grammar does not accept the token here
   BadToken,     ///< the grammar has no label for the token
   TooMuchInput, ///< a token after the start symbol was complete
-  TooDeep,      ///< more than MaxDepth nonterminals open
+  TooDeep,      ///< more than the parser's maxDepth() nonterminals open
   NoProgress,   ///< the grammar pushes and pops without taking the token
   Aborted,      ///< the sink refused a callback
   NotReady,     ///< no setup() since construction or since the last error
 };
 
-/// Open nonterminals allowed at once; the bound of CPython's own parser.
+/// Open nonterminals allowed at once by default; the bound of CPython's own
+/// parser before 3.8 (3.8's is 1700).
 constexpr size_t MaxParseDepth = 1500;
 
-/// Pushes and pops one token may cause at most. A compiled grammar needs at
-/// most the pops of the open frames, one push chain and the pops after the
-/// shift; first sets that disagree with the arcs would loop forever.
-constexpr size_t MaxStepsPerToken = 4 * MaxParseDepth;
+/// The largest bound a parser may be given.
+constexpr size_t MaxParseDepthLimit = 100000;
+
+/// Pushes and pops one token may cause at most, per open nonterminal allowed.
+/// A compiled grammar needs at most the pops of the open frames, one push
+/// chain and the pops after the shift; first sets that disagree with the arcs
+/// would loop forever.
+constexpr size_t StepsPerDepth = 4;
 
 /// Drives one parse at a time over a shared Grammar.
 ///
@@ -42,10 +47,12 @@ constexpr size_t MaxStepsPerToken = 4 * MaxParseDepth;
 /// setup() calls none of them: the sink opens the start symbol itself.
 template <class Sink> class Parser {
 public:
-  static constexpr size_t MaxDepth = MaxParseDepth;
+  /// Limit: the most nonterminals open at once, 1..MaxParseDepthLimit.
+  Parser(const Grammar &G, Sink &S, size_t Limit = MaxParseDepth)
+      : MaxDepth(Limit), G(G), S(S), Stack(new Frame[Limit]) {}
 
-  Parser(const Grammar &G, Sink &S)
-      : G(G), S(S), Stack(new Frame[MaxDepth]) {}
+  /// The most nonterminals open at once (TooDeep beyond).
+  const size_t MaxDepth;
 
   /// Starts a new input at StartSymbol; false when it has no DFA.
   bool setup(int StartSymbol) {
@@ -74,7 +81,7 @@ public:
       return fail(Status::BadToken);
     const uint32_t Terminal = G.terminalOf(static_cast<uint32_t>(L));
     for (size_t Steps = 0;; ++Steps) {
-      if (Steps == MaxStepsPerToken)
+      if (Steps == StepsPerDepth * MaxDepth)
         return fail(Status::NoProgress);
       uint32_t M = G.move(top().State, Terminal);
       if (M < Grammar::MoveFirst) {

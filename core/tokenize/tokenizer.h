@@ -59,10 +59,10 @@ enum class TokenKind : uint8_t {
   DOUBLESLASH = 48,
   DOUBLESLASHEQUAL = 49,
   AT = 50,
-  ATEQUAL = 51,
   RARROW = 51,
   ELLIPSIS = 52,
   COLONEQUAL = 55, ///< `:=`; 53 and 54 are the grammar's AWAIT and ASYNC
+  ATEQUAL = 56,    ///< `@=`, apart from `->` so that no grammar confuses them
   ERRORTOKEN = 201,
   COMMENT = 202,
   CONTINUATION = 203,

@@ -17,6 +17,7 @@ constexpr const char *NotReady =
     "Parser.setup() must be called before addtoken(), and again after an error";
 constexpr const char *Busy = "Parser is busy: called again from convert()";
 constexpr const char *UnknownStart = "Unknown start symbol: %ld";
+constexpr const char *BadMaxDepth = "maxdepth must be between 1 and %ld";
 constexpr const char *ConvertMissing =
     "%.200s does not implement convert()";
 

@@ -50,11 +50,13 @@ PyObject *module_tablesbuilt(PyObject *, PyObject *) {
 PyMethodDef ModuleMethods[] = {
     {"CreateParser", optpgen::kwMethod(optpgen::createParser),
      METH_VARARGS | METH_KEYWORDS,
-     "CreateParser(grammar, converter, promotesinglechild=False) -> Parser\n\n"
+     "CreateParser(grammar, converter, promotesinglechild=False, "
+     "maxdepth=kMaxDepth) -> Parser\n\n"
      "converter: a NodeConverter, any object with convert(grammar, "
      "node_type, value, context, children), or None for raw tuples. With "
      "promotesinglechild a nonterminal with exactly one child is replaced "
-     "by that child and not converted."},
+     "by that child and not converted. maxdepth bounds the nonterminals "
+     "open at once."},
     {"_FeedTokens", optpgen::feedTokens, METH_VARARGS,
      "_FeedTokens(parser, tokens) -> bool\n\nparser.setup(), then "
      "parser.addtoken(*t) for each t of tokens until it returns True; "
@@ -71,8 +73,8 @@ extern "C" __attribute__((visibility("default"))) void initoptpgen() {
       "Native pgen parser engine: ParserGenerator, CreateParser, Parser, "
       "NodeConverter, ParseError.\n\n"
       "Parsers follow lib2to3.pgen2.parse.Parser token for token. Beyond it: "
-      "at most kMaxDepth nonterminals may be open at once (ParseError 'too "
-      "much nesting'); a token after the input is complete is a ParseError "
+      "at most kMaxDepth nonterminals (a parser's maxdepth) may be open at "
+      "once (ParseError 'too much nesting'); a token after the input is complete is a ParseError "
       "'too much input'; after any error, and before the first setup(), "
       "addtoken() raises RuntimeError until setup() is called; convert() may "
       "not call back into its parser (RuntimeError). A grammar object's "

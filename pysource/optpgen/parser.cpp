@@ -35,8 +35,7 @@ struct NodeFrame {
 /// never holds more than its MaxDepth).
 class FrameStack {
 public:
-  static constexpr size_t Capacity = pgen::MaxParseDepth;
-  FrameStack() : Frames(new NodeFrame[Capacity]) {}
+  explicit FrameStack(size_t Capacity) : Frames(new NodeFrame[Capacity]) {}
   bool empty() const { return Size == 0; }
   NodeFrame &back() { return Frames[Size - 1]; }
   void push_back(const NodeFrame &F) { Frames[Size++] = F; }
@@ -52,9 +51,10 @@ private:
 /// Parser state; the engine's sink.
 class ParserImpl {
 public:
-  ParserImpl(GrammarPtr T, PyObject *G, PyObject *C, bool Promote)
+  ParserImpl(GrammarPtr T, PyObject *G, PyObject *C, bool Promote,
+             size_t MaxDepth)
       : Tables(std::move(T)), Grammar(G), Converter(C), Promote(Promote),
-        Raw(C == nullptr), Driver(*Tables, *this) {
+        Raw(C == nullptr), Frames(MaxDepth), Driver(*Tables, *this, MaxDepth) {
     Py_INCREF(Grammar);
     Py_XINCREF(Converter);
     Native = Raw ? nullptr : nativeConvertOf(Converter);
@@ -391,17 +391,38 @@ PyObject *parser_get_promote(PyObject *Self, void *) {
 PyObject *parser_get_usesnative(PyObject *Self, void *) {
   return PyBool_FromLong(impl(Self).Native != nullptr);
 }
+PyObject *parser_get_maxdepth(PyObject *Self, void *) {
+  return PyInt_FromSize_t(impl(Self).Driver.MaxDepth);
+}
+
+/// The maxdepth argument: an int in 1..MaxParseDepthLimit.
+size_t maxDepthArg(PyObject *O) {
+  tl::expectType(PyInt_Check(O) || PyLong_Check(O), "int", O);
+  long V = PyInt_AsLong(O);
+  if (V == -1 && PyErr_Occurred()) {
+    if (!PyErr_ExceptionMatches(PyExc_OverflowError))
+      throw tl::PyErrSet();
+    PyErr_Clear();
+  }
+  if (V < 1 || static_cast<unsigned long>(V) > pgen::MaxParseDepthLimit)
+    tl::raiseFormat(PyExc_ValueError, msg::BadMaxDepth,
+                    static_cast<long>(pgen::MaxParseDepthLimit));
+  return static_cast<size_t>(V);
+}
 
 PyObject *parser_new(PyTypeObject *Type, PyObject *Args, PyObject *Kw) {
   return guard<PyObject *>(nullptr, [&] {
     PyObject *Grammar, *Converter = Py_None, *PromoteObj = Py_False;
+    PyObject *DepthObj = nullptr;
     static const char *Names[] = {"grammar", "converter", "promotesinglechild",
-                                  nullptr};
-    if (!PyArg_ParseTupleAndKeywords(Args, Kw, "O|OO:Parser",
+                                  "maxdepth", nullptr};
+    if (!PyArg_ParseTupleAndKeywords(Args, Kw, "O|OOO:Parser",
                                      const_cast<char **>(Names), &Grammar,
-                                     &Converter, &PromoteObj))
+                                     &Converter, &PromoteObj, &DepthObj))
       throw tl::PyErrSet();
     bool Promote = tl::requireStatus(PyObject_IsTrue(PromoteObj)) != 0;
+    size_t MaxDepth = DepthObj && DepthObj != Py_None ? maxDepthArg(DepthObj)
+                                                      : pgen::MaxParseDepth;
     if (Converter == Py_None)
       Converter = nullptr;
     else if (!PyObject_TypeCheck(Converter, &NodeConverterType) &&
@@ -410,7 +431,8 @@ PyObject *parser_new(PyTypeObject *Type, PyObject *Args, PyObject *Kw) {
     GrammarPtr Tables = tablesFor(Grammar);
     Ref Self = require(Type->tp_alloc(Type, 0));
     auto *O = reinterpret_cast<ParserObject *>(Self.get());
-    O->Impl = new ParserImpl(std::move(Tables), Grammar, Converter, Promote);
+    O->Impl = new ParserImpl(std::move(Tables), Grammar, Converter, Promote,
+                             MaxDepth);
     return Self.release();
   });
 }
@@ -460,6 +482,8 @@ PyGetSetDef ParserGetSets[] = {
     {const_cast<char *>("promotesinglechild"), parser_get_promote, nullptr,
      const_cast<char *>("nonterminals with one child are replaced by it"),
      nullptr},
+    {const_cast<char *>("maxdepth"), parser_get_maxdepth, nullptr,
+     const_cast<char *>("the most nonterminals open at once"), nullptr},
     {const_cast<char *>("_usesnative"), parser_get_usesnative, nullptr,
      const_cast<char *>("the converter's native slot is called directly"),
      nullptr},
@@ -545,14 +569,15 @@ PyObject *feedTokens(PyObject *, PyObject *Args) {
 
 PyObject *createParser(PyObject *, PyObject *Args, PyObject *Kw) {
   return guard<PyObject *>(nullptr, [&] {
-    PyObject *Grammar, *Converter, *Promote = Py_False;
+    PyObject *Grammar, *Converter, *Promote = Py_False, *MaxDepth = Py_None;
     static const char *Names[] = {"grammar", "converter", "promotesinglechild",
-                                  nullptr};
-    if (!PyArg_ParseTupleAndKeywords(Args, Kw, "OO|O:CreateParser",
+                                  "maxdepth", nullptr};
+    if (!PyArg_ParseTupleAndKeywords(Args, Kw, "OO|OO:CreateParser",
                                      const_cast<char **>(Names), &Grammar,
-                                     &Converter, &Promote))
+                                     &Converter, &Promote, &MaxDepth))
       throw tl::PyErrSet();
-    Ref CallArgs = require(PyTuple_Pack(3, Grammar, Converter, Promote));
+    Ref CallArgs =
+        require(PyTuple_Pack(4, Grammar, Converter, Promote, MaxDepth));
     return parser_new(&ParserType, CallArgs.get(), nullptr);
   });
 }
@@ -601,11 +626,13 @@ const ParserApi *parserApi() {
 int initParser(PyObject *Module) {
   tl::TypeDesc D;
   D.Name = "pysource.optpgen.Parser";
-  D.Doc = "Parser(grammar, converter=None, promotesinglechild=False)\n\n"
+  D.Doc = "Parser(grammar, converter=None, promotesinglechild=False, "
+          "maxdepth=kMaxDepth)\n\n"
           "LL(1) parser over a pgen grammar object. Call setup(), then "
           "addtoken() for each token until it returns True, then "
           "getrootnode(). Without a converter nodes are (type, value, "
-          "context, children) tuples.";
+          "context, children) tuples. At most maxdepth nonterminals (1 to "
+          "kMaxDepthLimit) may be open at once.";
   D.Size = sizeof(ParserObject);
   D.Flags = Py_TPFLAGS_DEFAULT;
   D.Methods = ParserMethods;
@@ -617,7 +644,9 @@ int initParser(PyObject *Module) {
   D.WeakListOffset = offsetof(ParserObject, WeakRefs);
   if (tl::readyType(ParserType, D) < 0)
     return -1;
-  if (PyModule_AddIntConstant(Module, "kMaxDepth", pgen::MaxParseDepth) < 0)
+  if (PyModule_AddIntConstant(Module, "kMaxDepth", pgen::MaxParseDepth) < 0 ||
+      PyModule_AddIntConstant(Module, "kMaxDepthLimit",
+                              pgen::MaxParseDepthLimit) < 0)
     return -1;
   return tl::addType(Module, "Parser", ParserType);
 }

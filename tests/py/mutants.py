@@ -1,11 +1,13 @@
 """Mutated real statements judged by CPython: the analyzer's syntax verdicts against compile().
 
 One-line statements of a standard library are mutated once or twice (a token
-deleted, inserted from a pool, swapped with its neighbour or replaced), put in
-a random enclosing block (module, def, class, loop, async def), a quarter of
-them damaged as only the whole file shows (indentation, a stray decorator, a
-late future import, a header with no body, a break or continue on a line of
-its own) and compiled by the CPython of the same version. Run as a script to print the disagreements:
+deleted, inserted from a pool, swapped with its neighbour or replaced, or an
+operator such as '->' or '@=' inserted; f-string literals damaged inside their
+quotes), put in a random enclosing block (module, def, class, loop, async def),
+a quarter of them damaged as only the whole file shows (indentation, a stray
+decorator, a late future import, a header with no body, a break or continue on
+a line of its own) and compiled by the CPython of the same version. Run as a
+script to print the disagreements:
 
     python2.7 -m tests.py.mutants 3.6 [count]
 """
@@ -27,6 +29,9 @@ kPool = (b'=', b'(', b')', b'[', b']', b',', b'*', b'**', b'.', b':', b'+', b'-'
          b'else', b'for', b'del', b'await', b'async', b'global', b'nonlocal', b'break', b'continue',
          b'1', b"'s'", b'x', b'f', b'...', b'is', b'and', b'as', b'from', b'import', b'print',
          b'pass', b'with', b'{', b'}', b';')
+# Operators inserted anywhere: tokens that only the lexer tells from their
+# neighbours ('->' from '@=', ':=' before 3.8, '**' beside '*').
+kOperators = (b'->', b'@=', b':=', b'**')
 kContexts = {
     'module': (b'', b''),
     'def': (b'def f():\n', b'    '),
@@ -89,12 +94,14 @@ def Mutate(toks, rnd):
         toks[i] = MutateFString(toks[i], rnd)
         return toks
     for _ in range(rnd.choice((1, 1, 2))):
-        op = rnd.randrange(4)
-        i = rnd.randrange(len(toks) + (op == 1))
+        op = rnd.randrange(5)
+        i = rnd.randrange(len(toks) + (op in (1, 4)))
         if op == 0 and len(toks) > 1:
             del toks[i]
         elif op == 1:
             toks.insert(i, rnd.choice(kPool))
+        elif op == 4:
+            toks.insert(i, rnd.choice(kOperators))
         elif op == 2 and i + 1 < len(toks):
             toks[i], toks[i + 1] = toks[i + 1], toks[i]
         elif i < len(toks):

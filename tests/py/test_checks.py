@@ -80,6 +80,13 @@ kCases = [
     ('del a, *b', kNo, ("can't use starred expression here", 1, 7)),
     ('x = (*a)', kNo, ("can't use starred expression here", 1, 5)),
     ('a, *b = c', kNo, None),
+    ('a, (*b)', kNo, None),
+    ('x = [(*b)] + [a, ((*b))]', kNo, None),
+    ('f(a, (*b))', kNo, None),
+    ('x[a, (*b)]', kNo, None),
+    ('x[a:b, (*c)]', kNo, ("can't use starred expression here", 1, 8)),
+    ('[(*a) for a in b]', kNo, ('iterable unpacking cannot be used in comprehension', 1, 1)),
+    ('a, *(*b) = c', kNo, ('starred assignment target must be in a list or tuple', 1, 5)),
     ('[*a] = b', kNo, None),
     ('x = *a, *b', kNo, None),
     ('print(*a, *b)', kNo, None),
@@ -122,6 +129,11 @@ kCases = [
     ('async def f(): await x', kNo, None),
     ('async def f():\n    x = [await a for a in b]', kNo, None),
     ('async def f():\n    def g(): x = [a async for a in b]', kNo, ('asynchronous comprehension outside of an asynchronous function', 2, 0)),
+    ('async def f():\n    return [[x async for x in y] for z in w]', kNo, ('asynchronous comprehension outside of an asynchronous function', 2, 0)),
+    ('async def f():\n    return [x for z in w if [a async for a in z]]', kNo, ('asynchronous comprehension outside of an asynchronous function', 2, 0)),
+    ('async def f():\n    return [(x async for x in y) for z in w]', kNo, ('asynchronous comprehension outside of an asynchronous function', 2, 0)),
+    ('async def f():\n    return [[x async for x in y] async for z in w]', kNo, None),
+    ('async def f():\n    return [x for x in [a async for a in z]]', kNo, None),
     ('def f():\n    from __future__ import division', ('from __future__ imports must occur at the beginning of the file', 2, None), ('from __future__ imports must occur at the beginning of the file', 2, 4)),
     ('from __future__ import braces', ('not a chance', 1, None), ('not a chance', 1, 0)),
     ('from __future__ import nope', ('future feature nope is not defined', 1, None), ('future feature nope is not defined', 1, 0)),
@@ -138,14 +150,139 @@ kCases = [
 kNewIn38 = ['(a := 1)', '(f() := 1)', '(a.b := 1)', '[x := 1 for x in y]', '[y := 1 for x in z]', 'f(a := 1)',
             'def f(a=1, /, b): pass', 'def f(a, a, /): pass', 'def f(a, /, b): pass', 'await x', 'def f(): await x',
             'class C: [(y := 1) for x in z]', '[(x := 1) for x in y]', '[i := 0 for i, j in y]', 'del (a := 1)',
-            '[x for x in (y := z)]', 'def f():\n    return [i async for i in y]', 'def f():\n    return (i async for i in y)', 'f(a.b := 1)', 'f(a=1, b := 2)', 'return *a', 'f(True=1)', 'f((a)=1)', '[(yield) for x in y]', 'x = {(yield) for x in y}']
+            '[x for x in (y := z)]', 'def f():\n    return [i async for i in y]', 'def f():\n    return (i async for i in y)', 'f(a.b := 1)', 'f(a=1, b := 2)', 'return *a', 'f(True=1)', 'f((a)=1)', '[(yield) for x in y]', 'x = {(yield) for x in y}',
+            'l = [i async for i in g]', 'class C: l = [await x for x in y]', 'l = (i async for i in g)']
 # Placed where CPython does not put them: `import *` in a def (CPython points at the
 # def, another record) and 3.8's asynchronous comprehension (CPython says line 0).
 kPlacedElsewhere = ('def f():\n    from os import *\n', 'async def f():\n    def g(): x = [a async for a in b]\n',
-                    'def f():\n    return [i async for i in y]\n')
+                    'def f():\n    return [i async for i in y]\n',
+                    'async def f():\n    return [[x async for x in y] for z in w]\n',
+                    'async def f():\n    return [x for z in w if [a async for a in z]]\n',
+                    'l = [i async for i in g]\n', 'class C: l = [await x for x in y]\n')
+
+# Tokens the lexer must tell apart for the grammar: (source, versions that accept it);
+# the others say 'invalid syntax'.
+kPy3Versions = ('3.5', '3.6', '3.7', '3.8')
+kTokenCases = [
+    ('x -> y', ()),
+    ('lambda: x -> y', ()),
+    ('def f() @= int: pass', ()),
+    ('x @= y', kPy3Versions),
+    ('a.b[0] @= c', kPy3Versions),
+    ('def f() -> int: pass', kPy3Versions),
+]
+
+# The deepest nesting each CPython parses (its parser stack: 1500 entries, 1700 from 3.8 on),
+# as measured with each version's interpreter; 3.5 has 3.6's grammar depth and stack.
+kNestingForms = {
+    'parens': lambda n: 'x = ' + '(' * n + '1' + ')' * n,
+    'calls': lambda n: 'x = ' + 'f(' * n + '1' + ')' * n,
+    'nots': lambda n: 'x = ' + 'not ' * n + '1',
+    'lambdas': lambda n: 'x = ' + 'lambda: ' * n + '1',
+}
+kNestingLimits = {
+    '2.7': {'parens': 98, 'calls': 92, 'nots': 1480, 'lambdas': 740},
+    '3.5': {'parens': 92, 'calls': 87, 'nots': 1479, 'lambdas': 739},
+    '3.6': {'parens': 92, 'calls': 87, 'nots': 1479, 'lambdas': 739},
+    '3.7': {'parens': 92, 'calls': 87, 'nots': 1479, 'lambdas': 739},
+    '3.8': {'parens': 98, 'calls': 98, 'nots': 1679, 'lambdas': 839},
+}
+
+# Number literals: the message of CPython 2.7, 3.5, 3.6 and 3.7, and 3.8 (None: accepted).
+kZeros = 'leading zeros in decimal integer literals are not permitted; use an 0o prefix for octal integers'
+kBad, kSyntax = 'invalid token', 'invalid syntax'
+kNumberCases = [
+    ('x = 0777', None, kBad, kBad, kZeros),
+    ('x = 0777L', None, kBad, kBad, kZeros),
+    ('x = 09', kBad, kBad, kBad, kZeros),
+    ('x = 09.5 + 09e1 + 09j + 00', None, None, None, None),
+    ('x = 0_7', kSyntax, kSyntax, kBad, kZeros),
+    ('x = 1_000 + 0x_f + 1_0.0_1e1_0j', kSyntax, kSyntax, None, None),
+    ('x = 1__0', kSyntax, kSyntax, kBad, 'invalid decimal literal'),
+    ('x = 1_.0', kSyntax, kSyntax, kBad, 'invalid decimal literal'),
+    ('x = 6e-', kBad, kBad, kBad, 'invalid decimal literal'),
+    ('x = 1e', kSyntax, kSyntax, kSyntax, kSyntax),
+    ('x = 0o8', kBad, kBad, kBad, "invalid digit '8' in octal literal"),
+    ('x = 0b12', kSyntax, kSyntax, kSyntax, "invalid digit '2' in binary literal"),
+    ('x = 0b1_2', kSyntax, kSyntax, kBad, "invalid digit '2' in binary literal"),
+    ('x = 0xg', kBad, kBad, kBad, 'invalid hexadecimal literal'),
+    ('x = 0xL', kBad, kBad, kBad, 'invalid hexadecimal literal'),
+    ('x = 0or 1', kBad, kBad, kBad, 'invalid octal literal'),
+    ('x = 10L + 0x1fL', None, kSyntax, kSyntax, kSyntax),
+    ('x = 1.0L', kSyntax, kSyntax, kSyntax, kSyntax),
+    ('x = 1._0', kSyntax, kSyntax, kSyntax, kSyntax),
+    ('x = 0if 1else 2', None, None, None, None),
+]
+
+# String literals the decoders reject: the message of CPython 2.7 and of 3.5 to 3.8.
+kDecode = "(unicode error) 'unicodeescape' codec can't decode bytes in position "
+kStringCases = [
+    (u"x = '\xe9\\u12'", None, kDecode + '10-13: truncated \\uXXXX escape'),
+    (u"x = 'a\\\xe9\\x1'", kNo, kDecode + '17-19: truncated \\xXX escape'),
+    (u"x = '\\N{'", None, kDecode + '0-2: malformed \\N character escape'),
+    (u"x = '\\U00110000'", None, kDecode + '0-9: illegal Unicode character'),
+    (u"x = u'\\N{EM DASH}\\N{NOPE}'", kDecode + '11-18: unknown Unicode character name', kNo),
+    (u"x = u'\\N{EM DASH}' + '\\N{EM DASH}'", None, None),
+    (u"x = ur'\\\\u12 \\u12'",
+     "(unicode error) 'rawunicodeescape' codec can't decode bytes in position 6-9: truncated \\uXXXX", kSyntax),
+    (u"x = b'\\x1g'", kNo, '(value error) invalid \\x escape at position 0'),
+    (u"x = br'\xe9'", None, 'bytes can only contain ASCII literal characters.'),
+    (u"x = rb'\\x' + r'\\u12' + b'\\\\x'", kSyntax, None),
+]
 
 
 class ChecksTest(unittest.TestCase):
+
+    def testStringLiterals(self):
+        wrong = []
+        for source, want27, want3 in kStringCases:
+            for version in analysis.kVersions:
+                want = want27 if version == '2.7' else want3
+                if want == kNo:
+                    continue
+                got = mutants.Ours(version, source.encode('utf-8') + b'\n')
+                if (got and got[0]) != want:
+                    wrong.append((version, source, want, got))
+        self.assertEqual(wrong, [])
+        # Found after parsing, they have CPython's offset of the string (none under 2.7).
+        for version, offset in (('2.7', None), ('3.6', 4), ('3.8', 5)):
+            self.assertEqual(mutants.Ours(version, b"x = u'\\u12'\n")[1:], [1, offset])
+
+    def testNumberLiterals(self):
+        wrong = []
+        for source, want27, want35, want36, want38 in kNumberCases:
+            for version, want in (('2.7', want27), ('3.5', want35), ('3.6', want36), ('3.7', want36),
+                                  ('3.8', want38)):
+                got = mutants.Ours(version, source.encode('utf-8') + b'\n')
+                if (got and got[0]) != want:
+                    wrong.append((version, source, want, got))
+        self.assertEqual(wrong, [])
+
+    def testNestingLimits(self):
+        import StringIO
+        wrong = []
+        stdout, sys.stdout = sys.stdout, StringIO.StringIO()   # the walker's notes on deep trees
+        try:
+            for version, limits in sorted(kNestingLimits.items()):
+                for form, limit in sorted(limits.items()):
+                    for depth, want in ((limit, None), (limit + 1, 'invalid syntax')):
+                        source = kNestingForms[form](depth).encode('utf-8') + b'\n'
+                        got = mutants.Ours(version, source)
+                        if (got and got[0]) != want:
+                            wrong.append((version, form, depth, got))
+        finally:
+            sys.stdout = stdout
+        self.assertEqual(wrong, [])
+
+    def testTokensTheGrammarTellsApart(self):
+        wrong = []
+        for source, accepted in kTokenCases:
+            for version in analysis.kVersions:
+                want = None if version in accepted else 'invalid syntax'
+                got = mutants.Ours(version, source.encode('utf-8') + b'\n')
+                if (got and got[0]) != want:
+                    wrong.append((version, source, want, got))
+        self.assertEqual(wrong, [])
 
     def testCasesAgainstCPython(self):
         # CPython places "import *" in a def at the def; the line's own statement is all we have.

@@ -32,9 +32,9 @@ kVersions = ('2.7', '3.5', '3.6', '3.7', '3.8')
 
 # Token numbering the analyzer passes to the parser generator.
 kTokNumber2Name = dict(token.tok_name)
-kTokNumber2Name.update({51: 'RARROW', 53: 'AWAIT', 54: 'ASYNC', 55: 'COLONEQUAL'})
+kTokNumber2Name.update({51: 'RARROW', 53: 'AWAIT', 54: 'ASYNC', 55: 'COLONEQUAL', 56: 'ATEQUAL'})
 kOpText2Number = dict(pgen_grammar.opmap)
-kOpText2Number.update({'...': 52, '->': 51, ':=': 55})
+kOpText2Number.update({'...': 52, '->': 51, ':=': 55, '@=': 56})
 NAME, NUMBER, STRING, NEWLINE, ENDMARKER = 1, 2, 3, 4, 0
 COLON, AT, AWAIT, ASYNC = 11, 50, 53, 54
 kErrorToken = 201
@@ -415,7 +415,7 @@ def _Pool(version):
              '(', ')', '[', ']', '{', '}', ':', ',', '=', '*', '**', '.', '@',
              '-', ';', '+=', '`']
     if version != '2.7':
-        texts += ['...', 'nonlocal']
+        texts += ['...', 'nonlocal', '->', '@=']
     toks = []
     for text in texts:
         if text[0].isalpha():
@@ -464,11 +464,10 @@ def _Mutants(source_files, version, per_file, seed=99):
         for toks in rnd.sample(lines, min(per_file, len(lines))):
             mutant = Mutate(toks, rnd, pool)
             texts = [t for _, t in mutant]
-            # Token numbers shared by two texts ("<>" and "!=", "->" and
-            # "@=") make lines the interpreter tells apart look alike.
+            # A token number shared by two texts ("<>" and "!=") makes lines
+            # the interpreter tells apart look alike.
             if not mutant or 'async' in texts or 'await' in texts or (
-                    version != '2.7' and ('<>' in texts or '->' in texts
-                                          or '@=' in texts)):
+                    version != '2.7' and '<>' in texts):
                 continue
             mutants.append(mutant)
     return mutants
@@ -656,11 +655,15 @@ kSnippets = [
     ('print(x, file=f)', kPy3),
     ('exec code in ns', ('2.7',)),
     ('x = `y`', ('2.7',)),
-    # "<>" and "!=" share one token number, and so do "->" and "@=": no
-    # grammar can tell them apart.
+    # "<>" and "!=" share one token number: no grammar can tell them apart.
+    # "->" and "@=" have a number each.
     ('if a <> b: pass', kAll),
-    ('x -> y', kPy3),
-    ('def f() @= int: pass', kPy3),
+    ('x -> y', ()),
+    ('lambda: x -> y', ()),
+    ('def f() @= int: pass', ()),
+    ('x @= y', kPy3),
+    ('x.y[0] @= f(z)', kPy3),
+    ('def f() -> int: pass', kPy3),
     ('if a != b: pass', kAll),
     ('def f((a, b), c=1): pass', ('2.7',)),
     ('def f(a, (b, c)=(1, 2), *args, **kw): pass', ('2.7',)),

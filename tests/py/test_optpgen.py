@@ -292,6 +292,34 @@ class ErrorTest(OptpgenTestBase):
                 [(NEWLINE, '\n', 0), (ENDMARKER, None, 0)])
         self.assertTrue(Feed(optpgen.CreateParser(grammar, None), toks))
 
+    def testMaxDepth(self):
+        grammar = corpus.GrammarFor('2.7')
+
+        def Opened(parser):
+            parser.setup()
+            for i in xrange(100000):
+                try:
+                    parser.addtoken(LPAR, '(', i)
+                except optpgen.ParseError as e:
+                    self.assertEqual(e.msg, 'too much nesting')
+                    return i
+        default = optpgen.CreateParser(grammar, None)
+        self.assertEqual(default.maxdepth, optpgen.kMaxDepth)
+        deeper = optpgen.CreateParser(grammar, Recorder(), True, maxdepth=optpgen.kMaxDepth + 200)
+        self.assertEqual(deeper.maxdepth, optpgen.kMaxDepth + 200)
+        # Each parenthesis opens the same chain of nonterminals, so 200 more
+        # frames hold a fixed number more of them.
+        self.assertGreater(Opened(deeper), Opened(default))
+        shallow = optpgen.Parser(grammar, maxdepth=1)
+        self.assertEqual(Opened(shallow), 0)
+        self.assertTrue(Feed(deeper, kAssign))
+        for bad in (0, -1, optpgen.kMaxDepthLimit + 1, 2 ** 70):
+            with self.assertRaises(ValueError):
+                optpgen.CreateParser(grammar, None, maxdepth=bad)
+        for bad in ('10', 1.5):
+            with self.assertRaises(TypeError):
+                optpgen.Parser(grammar, maxdepth=bad)
+
     def testMisuse(self):
         p = optpgen.CreateParser(self.grammar, None)
         with self.assertRaises(RuntimeError):

@@ -36,9 +36,11 @@ def TokenTables():
     names[51] = 'RARROW'
     names[53] = 'AWAIT'
     names[54] = 'ASYNC'
+    names[56] = 'ATEQUAL'
     ops = dict(_l2grammar.opmap)
     ops['...'] = 52
     ops['->'] = 51
+    ops['@='] = 56
     return names, ops
 
 

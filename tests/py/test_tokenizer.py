@@ -43,6 +43,7 @@ class GetTokenTypeTest(unittest.TestCase):
             (b'', 0), (b'\n', 4), (b'print', 1), (b'\xc3\xa9', 1), (b'0777L', 2), (b'.5', 2),
             (b"fR''", 3), (b"'unterminated", 3), (b'...', 52), (b'$', 201), (b'!', 201),
             (b'# c', 202), (b'\\', 203), (b'..', 23), (b"bu''", 1), (b':=', 55), (b':', 11),
+            (b'@=', 56), (b'->', 51), (b'@', 50),
         ]
         for text, want in cases:
             self.assertEqual(fa.GetTokenType(text), want, 'GetTokenType(%r)' % text)
@@ -50,7 +51,7 @@ class GetTokenTypeTest(unittest.TestCase):
     def testOperatorsMatchTheGrammarTable(self):
         from lib2to3.pgen2 import grammar
         for text, code in grammar.opmap.items():
-            want = 51 if text == '->' else code
+            want = {'->': 51, '@=': 56}.get(text, code)
             self.assertEqual(fa.GetTokenType(text), want, text)
 
     def testRejectsNonBytes(self):

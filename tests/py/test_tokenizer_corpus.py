@@ -17,6 +17,7 @@ from pysource.utils import GetLogicalsFromText
 
 kOpCodes = dict(grammar.opmap)
 kOpCodes['->'] = 51
+kOpCodes['@='] = 56
 kOpCodes['...'] = 52
 
 # Files where the version's own tokenize reads the text differently by design:

@@ -51,6 +51,7 @@ enum class Sym : uint8_t {
   YieldExpr,
   NamedExpr, // test ':=' test
   Sequence, // testlist, exprlist, testlist_star_expr, testlist_safe, testlist1
+  Subscriptlist,
   ExprStmt,
   AnnAssign,
   DelStmt,
@@ -125,6 +126,7 @@ const SymName SymNames[] = {
     {"testlist_star_expr", Sym::Sequence},
     {"testlist_safe", Sym::Sequence},
     {"testlist1", Sym::Sequence},
+    {"subscriptlist", Sym::Subscriptlist},
     {"expr_stmt", Sym::ExprStmt},
     {"annassign", Sym::AnnAssign},
     {"del_stmt", Sym::DelStmt},
@@ -275,6 +277,13 @@ N *strip(N *X) {
   return X;
 }
 
+/// The starred expression that X only wraps in parentheses, as in `(*a)`, or
+/// nullptr: the syntax tree keeps it as a starred item of what holds X.
+N *parenStarred(N *X) {
+  N *In = strip(X);
+  return In != X && symOf(In) == Sym::StarExpr ? In : nullptr;
+}
+
 /// What a subtree becomes in CPython's syntax tree, as far as the checks care.
 enum class Kind : uint8_t {
   Name,
@@ -324,6 +333,9 @@ struct Scope {
   std::vector<std::string> *IterVars = nullptr; ///< a comprehension's iteration variables
   bool InIterable = false;                     ///< in the iterable of a comprehension clause
   bool *Awaits = nullptr;                      ///< set when the comprehension awaits
+  /// Asynchronous comprehensions directly in this comprehension's scope: errors
+  /// unless it is asynchronous itself, which its later clauses may decide.
+  std::vector<N *> *AsyncInside = nullptr;
 };
 
 /// How CPython gives the offset of an error.
@@ -952,6 +964,19 @@ void Checker::load(N *X, const Scope &S) {
     return load(child(X, 1), S);
   case Sym::Sequence:
     return elements(X, S, count(X) > 1);
+  case Sym::Subscriptlist: {
+    // A tuple index, which may unpack items, unless an item is a slice.
+    bool Slices = false;
+    for (Py_ssize_t I = 0; I < count(X); ++I) {
+      N *C = child(X, I);
+      if (textIs(C, ":"))
+        Slices = true;
+      else if (!isLeaf(C) && symOf(C) == Sym::Other)
+        for (Py_ssize_t J = 0; J < count(C); ++J)
+          Slices = Slices || textIs(child(C, J), ":");
+    }
+    return elements(X, S, !Slices);
+  }
   default:
     for (Py_ssize_t I = 0; I < count(X); ++I)
       load(child(X, I), S);
@@ -963,10 +988,11 @@ void Checker::load(N *X, const Scope &S) {
 void Checker::elements(N *X, const Scope &S, bool StarOk) {
   for (Py_ssize_t I = 0; I < count(X); ++I) {
     N *C = child(X, I);
-    if (symOf(C) == Sym::StarExpr) {
+    N *Star = symOf(C) == Sym::StarExpr ? C : StarOk ? parenStarred(C) : nullptr;
+    if (Star) {
       if (!StarOk)
-        starred(C, S);
-      load(child(C, 1), S);
+        starred(Star, S);
+      load(child(Star, 1), S);
     } else {
       load(C, S);
     }
@@ -1024,6 +1050,8 @@ void Checker::atom(N *X, const Scope &S) {
       starred(In, S);
     return load(child(In, 1), S);
   }
+  if (N *Star = Paren ? nullptr : parenStarred(In))
+    return load(child(Star, 1), S); // [(*a)] is [*a]
   load(In, S);
 }
 
@@ -1174,6 +1202,8 @@ void Checker::call(N *Args, const Scope &S) {
     // f(x := 1): the argument holds the assignment expression's parts itself.
     if (Arg && count(A) == 3 && textIs(child(A, 1), ":="))
       namedExpr(A, S);
+    else if (N *Star = Py3 ? parenStarred(A) : nullptr)
+      load(child(Star, 1), S); // f((*a)) unpacks a as f(*a) does
     else
       load(A, S);
   }
@@ -1187,6 +1217,8 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
   Inner.NoLoop = true;
   bool Awaits = false;
   Inner.Awaits = &Awaits;
+  std::vector<N *> AsyncInside;
+  Inner.AsyncInside = &AsyncInside;
   Inner.ComprehensionAt = At;
   Inner.Comprehension = List ? "list comprehension"
                              : symOf(At) != Sym::Atom || textIs(child(At, 0), "(") ? "generator expression"
@@ -1229,7 +1261,7 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
     }
     load(child(In, 0), CS);
     load(child(In, 2), CS);
-  } else if (symOf(Elt) == Sym::StarExpr) {
+  } else if (symOf(Elt) == Sym::StarExpr || parenStarred(Elt)) {
     report(kAst, Elt, "iterable unpacking cannot be used in comprehension");
     return;
   } else {
@@ -1269,15 +1301,20 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
     }
     C = Next;
   }
-  // A comprehension that awaits or iterates asynchronously must be in an async
-  // def, but for a generator expression from 3.7 on.
+  // A comprehension that awaits or iterates asynchronously must be directly in
+  // an async def or in a comprehension that is asynchronous itself (not in a
+  // module or class body), but for a generator expression from 3.7 on.
+  const char *OutsideAsync = "asynchronous comprehension outside of an asynchronous function";
+  if (!(Async || Awaits))
+    for (N *Inside : AsyncInside)
+      report(kCompile, Inside, OutsideAsync, 0, Offset::LineStart);
   bool GenExp = NewScope && !List && (symOf(At) != Sym::Atom || textIs(child(At, 0), "("));
   if ((Async || Awaits) && Py3 && !(GenExp && Minor >= 7)) {
     const Scope *F = function(S);
-    while (F && F->B == Block::Comprehension)
-      F = F->Outer ? function(*F->Outer) : nullptr;
-    if (F && F->B != Block::AsyncFunction)
-      report(kCompile, At, "asynchronous comprehension outside of an asynchronous function", 0, Offset::LineStart);
+    if (F && F->B == Block::Comprehension && F->AsyncInside)
+      F->AsyncInside->push_back(At);
+    else if (!F || F->B != Block::AsyncFunction) // a module or class body too
+      report(kCompile, At, OutsideAsync, 0, Offset::LineStart);
   }
 }
 
@@ -1589,7 +1626,8 @@ void Checker::countStars(N *X, bool Top) {
   if (K == Kind::Starred) {
     if (Top)
       report(kCompile, X, "starred assignment target must be in a list or tuple");
-    countStars(child(X, 1), false);
+    // The item a starred target unpacks into is not in a list or tuple itself.
+    countStars(child(X, 1), true);
     return;
   }
   N *Seq = sequenceOf(X, K);
@@ -1607,7 +1645,7 @@ void Checker::countStars(N *X, bool Top) {
     report(kCompile, X, "two starred expressions in assignment");
   for (Py_ssize_t I = 0; I < count(Seq); I += 2) {
     N *C = strip(child(Seq, I));
-    countStars(kindOf(C) == Kind::Starred ? child(C, 1) : C, false);
+    countStars(kindOf(C) == Kind::Starred ? child(C, 1) : C, kindOf(C) == Kind::Starred);
   }
 }
 

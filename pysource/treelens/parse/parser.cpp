@@ -478,13 +478,14 @@ int parser_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
 
     Ref TokNumber2Name = tl::require(PyDict_Copy(Host.TokName));
     for (auto Entry : {std::make_pair(51, "RARROW"), std::make_pair(54, "ASYNC"), std::make_pair(53, "AWAIT"),
-                       std::make_pair(55, "COLONEQUAL")}) {
+                       std::make_pair(55, "COLONEQUAL"), std::make_pair(56, "ATEQUAL")}) {
       Ref K = tl::require(PyInt_FromLong(Entry.first));
       Ref V = tl::require(PyString_FromString(Entry.second));
       tl::requireStatus(PyDict_SetItem(TokNumber2Name.get(), K.get(), V.get()));
     }
     Ref OpText2Number = tl::require(PyDict_Copy(Host.OpMap));
-    for (auto Entry : {std::make_pair("...", 52), std::make_pair("->", 51), std::make_pair(":=", 55)}) {
+    for (auto Entry : {std::make_pair("...", 52), std::make_pair("->", 51), std::make_pair(":=", 55),
+                       std::make_pair("@=", 56)}) {
       Ref V = tl::require(PyInt_FromLong(Entry.second));
       tl::requireStatus(PyDict_SetItemString(OpText2Number.get(), Entry.first, V.get()));
     }
@@ -511,7 +512,11 @@ int parser_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
       throw tl::PyErrSet();
     Py_XSETREF(P->Keywords, KeywordDict.release());
 
-    Ref CreateKwds = tl::require(Py_BuildValue("{sO}", "promotesinglechild", Py_True));
+    // CPython's parser stack holds 1500 nonterminals before 3.8 and 1700 from 3.8 on.
+    Ref Py38 = tl::require(Py_BuildValue("(ii)", 3, 8));
+    long MaxDepth = tl::requireStatus(PyObject_RichCompareBool(VersionTriple, Py38.get(), Py_GE)) ? 1700 : 1500;
+    Ref CreateKwds =
+        tl::require(Py_BuildValue("{sOsl}", "promotesinglechild", Py_True, "maxdepth", MaxDepth));
     Ref CreateArgs = tl::require(PyTuple_Pack(2, P->Grammar, Self));
     Py_XSETREF(P->Parser, tl::require(PyObject_Call(Host.CreateParser, CreateArgs.get(), CreateKwds.get()))
                               .release());
