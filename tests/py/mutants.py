@@ -155,13 +155,37 @@ def Sources(version, count, seed=4321, files=None):
     return out
 
 
+# CPython reads a file before it compiles it: without a coding cookie,
+# Python 2's reader rejects bytes that are not ASCII and Python 3's bytes that
+# are not UTF-8, where compile() of the same bytes may let them through.
 kOracle = r'''
-import json, sys, warnings
+import json, re, sys, warnings
 warnings.simplefilter('ignore')
+PEP263 = 'but no encoding declared; see http://python.org/dev/peps/pep-0263/ for details'
+
+def Unread(data):
+    if re.match(br'(?:[ \t\f]*(?:#[^\n]*)?\n)?[ \t\f]*#.*?coding[:=]', data):
+        return None
+    if sys.version_info[0] == 2:
+        bad = re.search(br'[\x80-\xff]', data)
+        if bad:
+            return 'Non-ASCII character %r in file <string> on line %d, ' % (data[bad.start()], data.count(b'\n', 0, bad.start()) + 1) + PEP263
+        return None
+    try:
+        data.decode('utf-8')
+    except UnicodeDecodeError as e:
+        return "Non-UTF-8 code starting with '\\x%02x' in file <string> on line %d, " % (data[e.start], data.count(b'\n', 0, e.start) + 1) + PEP263
+    return None
+
 out = []
 for text in json.load(sys.stdin):
+    data = text.encode('latin-1')
+    unread = Unread(data)
+    if unread:
+        out.append([unread, int(unread.split(' on line ')[1].split(',')[0]), None])
+        continue
     try:
-        compile(text.encode('latin-1'), '<string>', 'exec')
+        compile(data, '<string>', 'exec')
         out.append(None)
     except SyntaxError as e:
         out.append([str(e.msg), e.lineno, e.offset])
