@@ -320,19 +320,36 @@ class WorkerPool(object):
                 busy += self._Give(worker, pending)
 
     def _Give(self, worker, pending):
+        """Sends the next task to an idle worker (to a new one if it has died
+        meanwhile); 1 when there was one, else 0."""
         for index, task in pending:
-            worker[1].send((index, task))
+            for _ in range(3):
+                try:
+                    worker[1].send((index, task))
+                    break
+                except (IOError, OSError):
+                    self._Discard(worker)
+                    worker = self._Start()
+            else:
+                raise RuntimeError('worker processes die as soon as they start')
             worker[3] = index
             return 1
         return 0
 
-    def _Died(self, worker, task):
+    def _Discard(self, worker):
+        """Forgets a dead worker; its exit code."""
         process = worker[0]
         self.workers.remove(worker)
         worker[1].close()
         worker[2].close()
         process.join(1)
-        code = process.exitcode
+        if process.is_alive():
+            process.terminate()
+            process.join()
+        return process.exitcode
+
+    def _Died(self, worker, task):
+        code = self._Discard(worker)
         how = ('killed by signal %d' % -code if code is not None and code < 0
                else 'exited with status %s' % code)
         result = analysis.FileAnalysis(task[0], status=analysis.kFailed,
