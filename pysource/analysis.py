@@ -26,7 +26,6 @@ the derived info the analyzer recorded; LineView turns one record into plain
 data. Texts are bytes throughout, exactly as in the source.
 """
 
-import errno
 import os
 import re
 import stat
