@@ -340,6 +340,22 @@ class _Captured(logging.Handler):
         self.records.append(record)
 
 
+def RemoveTree(top):
+    """Removes a folder tree without recursion (it may be deeper than the stack)
+    and without a child process (a fork right after threads ran may hang)."""
+    stack = [top]
+    while stack:
+        path = stack[-1]
+        entries = [os.path.join(path, n) for n in os.listdir(path)]
+        folders = [e for e in entries if os.path.isdir(e) and not os.path.islink(e)]
+        if folders:
+            stack.extend(folders)
+            continue
+        for entry in entries:
+            os.remove(entry)
+        os.rmdir(stack.pop())
+
+
 class ApiTest(HostileTestBase):
     """The analysis API under threads, a failing analyzer, and folders that
     hold what is not a source file."""
@@ -349,7 +365,7 @@ class ApiTest(HostileTestBase):
         self.tmp = tempfile.mkdtemp()
 
     def tearDown(self):
-        subprocess.call(['rm', '-rf', self.tmp])    # (shutil.rmtree recurses)
+        RemoveTree(self.tmp)
 
     def testThreadsGetTheSingleThreadedResult(self):
         text = b''.join(b'def f%d(a, b=x%d):\n    y = a + b\n    return [z for z in y]\n'
