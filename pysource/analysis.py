@@ -14,7 +14,12 @@ analyzer with its grammar, keyword list and the Python 3 hint grammar; a 2.7
 module that imports print_function from __future__ gets the 2.7 grammar
 variant without the print statement. 'auto' picks, per file, the newest version under which no
 line has a syntax error; a file that fails under every version keeps the
-errors of the newest one.
+errors of the version with the fewest lines in error (the newest on a tie).
+
+The analyzers may be used from several threads: each version's analyzer
+serves one line at a time (a lock), so every thread gets the result it would
+get alone. An unexpected failure inside the analyzer raises AnalysisFailure
+from AnalyzeText; AnalyzeFile and AnalyzeFolder report it as status kFailed.
 
 Results keep the logical-line records (pysource._fastaccess.CLogicalLine) with
 the derived info the analyzer recorded; LineView turns one record into plain
@@ -23,6 +28,9 @@ data. Texts are bytes throughout, exactly as in the source.
 
 import os
 import re
+import stat
+import sys
+import threading
 
 from pysource import _fastaccess
 from pysource import filechecks
@@ -70,8 +78,18 @@ kOk = 'ok'
 kSkipped = 'skipped'            # a folder met again through a symlink loop
 kSyntaxError = 'syntax-error'   # some line has a syntax error
 kUnreadable = 'unreadable'      # not read or not Python source: nothing analyzed
+kFailed = 'failed'              # the analysis itself failed (see AnalysisFailure)
 
-kStatusRank = {kOk: 0, kSkipped: 0, kSyntaxError: 1, kUnreadable: 2}
+kStatusRank = {kOk: 0, kSkipped: 0, kSyntaxError: 1, kUnreadable: 2, kFailed: 2}
+
+# Files larger than this are not read (reported as kUnreadable): a source
+# file that large is generated data, and reading it whole could exhaust memory.
+kMaxSourceBytes = 32 * 1024 * 1024
+
+
+class AnalysisFailure(RuntimeError):
+    """The analyzer failed unexpectedly on a line (it reported the traceback);
+    the line's result would be wrong, so none is given."""
 
 
 def UsesPrintFunction(logicals):
@@ -509,6 +527,8 @@ class VersionAnalyzer(object):
         self.checks = bool(checks)
         self._triple, self._grammar, self._py3 = kGrammars[version]
         self._impls = {}
+        # The native analyzers hold the state of one line at a time.
+        self._lock = threading.RLock()
 
     def Impl(self, print_function=False):
         """The treelens analyzer (CPGenAnalyzerImpl); print_function picks the 2.7 variant."""
@@ -526,7 +546,7 @@ class VersionAnalyzer(object):
                 grammar, keywords = self._grammar, None
             impl = treelens.CPGenAnalyzerImpl(self._triple, grammar, keywords, self._py3,
                                               kHintGrammar, self.checks)
-            self._impls[key] = impl
+            impl = self._impls.setdefault(key, impl)
         return impl
 
     def ImplFor(self, logicals):
@@ -534,12 +554,20 @@ class VersionAnalyzer(object):
         return self.Impl(not self._py3 and UsesPrintFunction(logicals))
 
     def AnalyzeLogical(self, impl, logical):
-        """Analyzes one record (again, if it was already); returns None or a SyntaxError."""
+        """Analyzes one record (again, if it was already); returns None or a SyntaxError.
+
+        Raises AnalysisFailure when the analyzer failed unexpectedly.
+        """
         if logical.fInspected:
             logical.fInspected = False
         # From 3.7 on async and await are keywords everywhere: no scope to look up.
         in_async_def = self._py3 and self._triple < (3, 7) and utils.InAsyncDef(logical)
-        error = impl.AnalyzeSingleLogical(logical, in_async_def)
+        with self._lock:
+            failures = impl.fFailures
+            error = impl.AnalyzeSingleLogical(logical, in_async_def)
+            if error is None and impl.fFailures != failures:
+                raise AnalysisFailure('analysis failed on line %d: %s'
+                                      % (logical.fFirstLine + 1, impl.fLastFailure))
         if error is None or self.checks:
             found = TokenError(self.version, logical)
             if found is not None and (error is None or _LexedFirst(logical, found, error)):
@@ -623,7 +651,8 @@ def GetAnalyzer(version, checks=True):
 
 
 def _AnalyzeAuto(logicals, checks, text=None, path=None):
-    """(version, errors) for 'auto': the newest version with no syntax error."""
+    """(version, errors) for 'auto': the newest version with no syntax error,
+    else the one with the fewest lines in error, the newest on a tie."""
     failed = None
     for version in kAutoOrder:
         analyzer = GetAnalyzer(version, checks)
@@ -639,9 +668,29 @@ def _AnalyzeAuto(logicals, checks, text=None, path=None):
         if any(e is not None for e in errors):
             continue
         return version, errors
-    errors = GetAnalyzer(kAutoOrder[0], checks).Analyze(logicals)
-    filechecks.Check(kAutoOrder[0], logicals, errors, text, path, checks)
-    return kAutoOrder[0], errors
+    # Every version fails: count the lines in error, each version stopping
+    # once it cannot do better than the best so far; the whole file's checks
+    # count for the versions that get that far.
+    best, fewest = None, len(logicals) + 1
+    for version in kAutoOrder:
+        analyzer = GetAnalyzer(version, checks)
+        impl = analyzer.ImplFor(logicals)
+        count = 0
+        for logical in logicals:
+            if analyzer.AnalyzeLogical(impl, logical) is not None:
+                count += 1
+                if count >= fewest:
+                    break
+        if count < fewest:
+            errors = analyzer.Analyze(logicals, False, impl)
+            filechecks.Check(version, logicals, errors, text, path, checks)
+            count = sum(1 for e in errors if e is not None)
+            if count < fewest:
+                best, fewest = version, count
+    # The records keep what the last analysis recorded: analyze them again.
+    errors = GetAnalyzer(best, checks).Analyze(logicals)
+    filechecks.Check(best, logicals, errors, text, path, checks)
+    return best, errors
 
 
 class FileAnalysis(object):
@@ -649,8 +698,11 @@ class FileAnalysis(object):
 
     path: as given (bytes or str); version: the version used, None when
     nothing was analyzed; logicals: the records; errors: None or a
-    SyntaxError per record; status: one of kOk, kSyntaxError, kUnreadable,
-    kSkipped; problem: why a file was not analyzed (kUnreadable, kSkipped).
+    SyntaxError per record, located in the file as CPython locates it
+    (filename the path, lineno the file's line, offset CPython's, text the
+    physical line); status: one of kOk, kSyntaxError, kUnreadable, kSkipped,
+    kFailed; problem: why a file was not (wholly) analyzed (kUnreadable,
+    kSkipped, kFailed).
     """
 
     __slots__ = ('path', 'version', 'logicals', 'errors', 'status', 'problem')
@@ -679,11 +731,51 @@ class FileAnalysis(object):
 def ErrorLocation(logical, error):
     """(line, column, message) of a record's SyntaxError: the line in the file, 1-based,
     and the byte column in that line, 1-based."""
+    if getattr(error, 'in_file', False):
+        return error.lineno, error.column, error.msg
     row = error.lineno or 1
     # The syntax checks give CPython's offset (0-based or None) and the
     # 1-based column apart.
     column = getattr(error, 'column', None) or error.offset or 1
     return logical.fFirstLine + row, column, error.msg
+
+
+def _PhysicalLine(logical, line):
+    """The physical line `line` (1-based, in the file) of a record, line end included."""
+    lines = logical.fLineText.splitlines(True)
+    row = line - logical.fFirstLine - 1
+    return lines[row] if 0 <= row < len(lines) else b''
+
+
+def CharColumn(text, column):
+    """The 1-based column in characters, as CPython 3 counts, of the 1-based
+    byte column in a physical line (UTF-8; a byte that is not counts one)."""
+    head = text[:column - 1]
+    return len(head.decode('utf-8', 'replace')) + (column - 1 - len(head)) + 1
+
+
+def ErrorPosition(logical, error):
+    """(line, column, byte column, message) of a record's SyntaxError: column
+    counts characters as CPython 3 does, byte column bytes; both 1-based."""
+    line, column, message = ErrorLocation(logical, error)
+    return line, CharColumn(_PhysicalLine(logical, line), column), column, message
+
+
+def _InFile(path, logical, error, py3):
+    """The error located in the file: lineno the file's line, filename the
+    path, text the physical line and offset as CPython's (characters under
+    Python 3, bytes under 2; the checks after parsing already give CPython's)."""
+    line, column, message = ErrorLocation(logical, error)
+    text = _PhysicalLine(logical, line)
+    offset = error.offset
+    if not hasattr(error, 'column') and py3:
+        offset = CharColumn(text, column)
+    filename = '<string>' if path is None else path
+    # IndentationError and TabError stay what they are.
+    located = type(error)(message, (filename, line, offset, text))
+    located.column = column
+    located.in_file = True
+    return located
 
 
 kNoDerivedInfo = ((), (), (), (), ())
@@ -711,9 +803,9 @@ def LineView(logical, error=None):
     defines (names defined), reads (names read), equivs ((name, info) type
     equivalences other than reads), args (argument names), arg_equivs ((name,
     info) pairs of the arguments), bases (base-class texts), error (None, or
-    a dict of message, line and column, 1-based), truncated (whether the walk
-    stopped at its limits, so that only what it recorded before is there).
-    Texts are bytes.
+    a dict of message, line, column and byte_column, 1-based; column counts
+    characters as CPython 3 does), truncated (whether the walk stopped at its
+    limits, so that only what it recorded before is there). Texts are bytes.
     """
     info = logical.GetDerivedInfo() or kNoDerivedInfo
     names, type_equivs, args, arg_equivs, bases = info
@@ -732,8 +824,9 @@ def LineView(logical, error=None):
         'truncated': bool(getattr(logical, 'fTruncated', False)),
     }
     if error is not None:
-        line, column, message = ErrorLocation(logical, error)
-        view['error'] = {'message': message, 'line': line, 'column': column}
+        line, column, byte_column, message = ErrorPosition(logical, error)
+        view['error'] = {'message': message, 'line': line, 'column': column,
+                         'byte_column': byte_column}
     return view
 
 
@@ -742,6 +835,8 @@ def AnalyzeText(text, version=kAuto, path=None, checks=True):
 
     Returns a FileAnalysis. A text with a NUL byte is not Python source: it is
     not analyzed and its status is kUnreadable. checks: as for GetAnalyzer.
+    path names the text in its syntax errors ('<string>' when None). Raises
+    AnalysisFailure when the analyzer fails unexpectedly.
     """
     if isinstance(text, unicode):
         text = text.encode('utf-8')
@@ -759,81 +854,183 @@ def AnalyzeText(text, version=kAuto, path=None, checks=True):
         errors = GetAnalyzer(version, checks).Analyze(logicals)
         filechecks.Check(version, logicals, errors, text, path, checks)
     failed = any(e is not None for e in errors)
+    if failed:
+        py3 = kGrammars[version][2]
+        errors = [e if e is None else _InFile(path, l, e, py3) for l, e in zip(logicals, errors)]
     return FileAnalysis(path, version, logicals, errors, kSyntaxError if failed else kOk)
 
 
+_kFileKinds = ((stat.S_ISDIR, 'Is a directory'), (stat.S_ISFIFO, 'a FIFO'),
+               (stat.S_ISCHR, 'a character device'), (stat.S_ISBLK, 'a block device'),
+               (stat.S_ISSOCK, 'a socket'))
+
+
+def _TooLarge(size):
+    return 'too large: %d bytes or more (the limit is %d bytes)' % (size, kMaxSourceBytes)
+
+
+def ReadBounded(stream, limit=None):
+    """(bytes, None) or (None, why not) for a stream read to its end, at most
+    limit bytes (kMaxSourceBytes by default)."""
+    limit = kMaxSourceBytes if limit is None else limit
+    data = stream.read(limit + 1)
+    if len(data) > limit:
+        return None, _TooLarge(len(data))
+    return data, None
+
+
 def ReadSource(path):
-    """(bytes, None) or (None, why the file cannot be read)."""
+    """(bytes, None) or (None, why the file cannot be read).
+
+    Only a regular file of at most kMaxSourceBytes is read; a FIFO, a device
+    or a socket is not, and opening one never blocks.
+    """
     try:
-        with open(path, 'rb') as f:
-            return f.read(), None
+        fd = os.open(path, os.O_RDONLY | getattr(os, 'O_NONBLOCK', 0) | getattr(os, 'O_NOCTTY', 0))
     except (IOError, OSError) as e:
         return None, 'cannot read: %s' % (e.strerror or e)
+    try:
+        st = os.fstat(fd)
+        if not stat.S_ISREG(st.st_mode):
+            kind = [name for test, name in _kFileKinds if test(st.st_mode)]
+            if kind == ['Is a directory']:
+                return None, 'cannot read: Is a directory'
+            return None, 'cannot read: not a regular file (%s)' % (kind[0] if kind else 'special')
+        if st.st_size > kMaxSourceBytes:
+            return None, _TooLarge(st.st_size)
+        with os.fdopen(os.dup(fd), 'rb') as f:
+            return ReadBounded(f)    # the file may have grown since
+    except (IOError, OSError) as e:
+        return None, 'cannot read: %s' % (e.strerror or e)
+    except MemoryError:
+        return None, 'cannot read: out of memory'
+    finally:
+        os.close(fd)
 
 
 def AnalyzeFile(path, version=kAuto, checks=True):
-    """Reads and analyzes one file; never raises for I/O errors (status kUnreadable)."""
-    if os.path.isdir(path):
-        return FileAnalysis(path, status=kUnreadable, problem='cannot read: Is a directory')
+    """Reads and analyzes one file; never raises for I/O errors (status
+    kUnreadable) nor for an analyzer failure (status kFailed)."""
     text, problem = ReadSource(path)
     if problem is not None:
         return FileAnalysis(path, status=kUnreadable, problem=problem)
-    return AnalyzeText(text, version, path, checks)
+    try:
+        return AnalyzeText(text, version, path, checks)
+    except AnalysisFailure as e:
+        return FileAnalysis(path, status=kFailed, problem=str(e))
 
 
-def IterSourcePaths(paths):
+def IterSourcePaths(paths, follow_links=False, roots=None):
     """Yields (path, status, problem) for the files and folders named by paths.
 
-    A folder is searched recursively for .py and .pyi files, each folder's
-    entries in sorted order, hidden ones (.git, .tox) skipped, symlinks
-    followed; a folder met again (through a
-    symlink loop or a second path to it) is not searched twice: a loop is
-    yielded with status kSkipped. A folder that cannot be listed is yielded
-    with kUnreadable. Files named directly are yielded whatever their suffix,
-    with status kOk (reading them is the caller's task).
+    A folder is searched for .py and .pyi files, each folder's entries in
+    sorted order, depth first, hidden ones (.git, .tox) skipped. Symlinks are
+    followed when they lead into one of the folders named by paths (or by
+    roots when given; anywhere with follow_links); one that leads elsewhere
+    is yielded with kSkipped. A folder met again (through a symlink loop or a second path to
+    it) is not searched twice: a loop is yielded with status kSkipped. A
+    folder that cannot be listed is yielded with kUnreadable. Files named
+    directly are yielded whatever their suffix, with status kOk (reading them
+    is the caller's task). Names need not decode: a unicode folder is
+    searched as bytes, and a found path that does not decode with the file
+    system's encoding is yielded as bytes.
     """
     seen = set()
+    if roots is None:
+        roots = [p for p in paths if os.path.isdir(p)]
+    roots = [os.path.realpath(_FsBytes(p)) for p in roots]
     for path in paths:
         if os.path.isdir(path):
-            for item in _WalkFolder(path, seen, []):
+            for item in _WalkFolder(path, seen, None if follow_links else roots):
                 yield item
         else:
             yield path, kOk, None
 
 
-def _WalkFolder(folder, seen, ancestors):
+def _FsEncoding():
+    return sys.getfilesystemencoding() or 'utf-8'
+
+
+def _FsBytes(path):
+    if not isinstance(path, unicode):
+        return path
     try:
-        st = os.stat(folder)
-        names = sorted(os.listdir(folder))
-    except OSError as e:
-        yield folder, kUnreadable, 'cannot list folder: %s' % (e.strerror or e)
-        return
-    key = (st.st_dev, st.st_ino)
-    if key in seen:
-        if key in ancestors:
-            yield folder, kSkipped, 'symlink loop: folder already being searched, not followed'
-        return
-    seen.add(key)
-    ancestors.append(key)
-    for name in names:
-        if name.startswith('.'):
+        return path.encode(_FsEncoding())
+    except UnicodeError:
+        return path.encode('utf-8')
+
+
+def _FsText(path):
+    try:
+        return path.decode(_FsEncoding())
+    except UnicodeError:
+        return path
+
+
+def _Within(path, roots):
+    for root in roots:
+        if path == root or path.startswith(root.rstrip(os.sep) + os.sep):
+            return True
+    return False
+
+
+def _WalkFolder(top, seen, roots):
+    """The walk of IterSourcePaths under one folder, without recursion (a tree
+    may be deeper than the interpreter's stack); roots None follows every link."""
+    as_text = isinstance(top, unicode)
+    stack = []      # (folder, its names still to visit, last first, (device, inode))
+
+    def Enter(folder):
+        try:
+            st = os.stat(folder)
+            names = sorted(os.listdir(folder), reverse=True)
+        except (OSError, IOError) as e:
+            return folder, kUnreadable, 'cannot list folder: %s' % (e.strerror or e)
+        key = (st.st_dev, st.st_ino)
+        if key in seen:
+            if any(key == k for _, _, k in stack):
+                return folder, kSkipped, 'symlink loop: folder already being searched, not followed'
+            return None
+        seen.add(key)
+        stack.append((folder, names, key))
+        return None
+
+    def Out(item):
+        return (_FsText(item[0]),) + item[1:] if as_text else item
+
+    item = Enter(_FsBytes(top))
+    if item is not None:
+        yield Out(item)
+    while stack:
+        folder, names = stack[-1][:2]
+        if not names:
+            stack.pop()
+            continue
+        name = names.pop()
+        if name.startswith(b'.'):
             continue
         path = os.path.join(folder, name)
+        source = name.endswith(kSourceSuffixes)
+        if roots is not None and os.path.islink(path) and not _Within(os.path.realpath(path), roots):
+            if source or os.path.isdir(path):
+                yield Out((path, kSkipped, 'symlink to outside the folders searched, not followed'))
+            continue
         if os.path.isdir(path):
-            for item in _WalkFolder(path, seen, ancestors):
-                yield item
-        elif name.endswith(kSourceSuffixes):
-            yield path, kOk, None     # also a dangling link: reading it reports the problem
-    ancestors.pop()
+            item = Enter(path)
+            if item is not None:
+                yield Out(item)
+        elif source:
+            yield Out((path, kOk, None))    # also a dangling link: reading it reports the problem
 
 
-def AnalyzeFolder(path, version=kAuto, checks=True):
+def AnalyzeFolder(path, version=kAuto, checks=True, follow_links=False):
     """Yields the FileAnalysis of every source file under a folder (or of a file), in order.
 
-    Unreadable files and folders and symlink loops are yielded too, with
-    their status and problem; nothing stops the search.
+    Unreadable files and folders, symlinks not followed and symlink loops are
+    yielded too, with their status and problem; nothing stops the search.
+    follow_links: as for IterSourcePaths.
     """
-    for found, status, problem in IterSourcePaths([path]):
+    for found, status, problem in IterSourcePaths([path], follow_links):
         if problem is not None:
             yield FileAnalysis(found, status=status, problem=problem)
         else:

@@ -3,15 +3,21 @@
     treelens [options] PATH...        (or: python2.7 -m pysource.cli ...)
 
 Each PATH is a file, a folder (searched recursively for .py and .pyi files,
-in sorted order), or - for standard input.
+in sorted order), or - for standard input. Only regular files of at most
+32 MiB are read; symlinks in a folder are followed only when they lead into
+one of the folders given (--follow-external-links follows any).
 
 Formats (--format):
-  text    one block per logical line that records something (default)
+  text    per analyzed file a line "path: version V", then one block per
+          logical line that records something (default)
   json    one document: {"files": [{"path", "version", "status", "problem",
           "lines": [...]}, ...]}
-  jsonl   one object per logical line, with its "path" and "version"
+  jsonl   one object per logical line, with its "path" and "version"; a file
+          with no logical line (empty, unreadable, skipped, failed) gets one
+          object {"path", "version", "status", "problem"} instead
 A line has the fields line, kind, text, defines, reads, equivs, args,
-arg_equivs, bases, error (null, or message, line and column, 1-based) and
+arg_equivs, bases, error (null, or message, line, column and byte_column,
+1-based; column counts characters as CPython does, byte_column bytes) and
 truncated (true when the walk stopped at its limits: only what it recorded
 before is there; a note on standard error names the line).
 Texts are the source bytes decoded as UTF-8; a byte that is not valid UTF-8
@@ -19,11 +25,14 @@ appears as the lone surrogate U+DC80 + byte, so that in Python 3
 text.encode('utf-8', 'surrogateescape') gives back the exact bytes.
 
 --errors-only prints only the syntax errors, as path:line:col: message (the
-column counts bytes from 1); with json or jsonl, only the lines with one.
+column counts characters from 1); with json or jsonl, only the lines with one
+and the records of files that were not analyzed. In the text formats a path's
+backslashes and control characters are escaped (\\\\, \\n, \\t, \\xNN).
 
 Exit status: 0 when every file was analyzed and no line has a syntax error,
-1 when some line has one, 2 for a usage error or a path that cannot be read
-(the other paths are still analyzed). Problems go to standard error.
+1 when some line has one, 2 for a usage error, a path that cannot be read, a
+file whose analysis failed (the other paths are still analyzed) or output
+that cannot be written, 130 when interrupted. Problems go to standard error.
 """
 
 from __future__ import print_function
@@ -33,6 +42,8 @@ import errno
 import json
 import os
 import re
+import select
+import signal
 import sys
 import time
 
@@ -40,8 +51,12 @@ from pysource import analysis
 
 kFormats = ('text', 'json', 'jsonl')
 kExitOk, kExitSyntax, kExitProblem = 0, 1, 2
+kExitInterrupted = 130
 kExitForStatus = {analysis.kOk: kExitOk, analysis.kSkipped: kExitOk,
-                  analysis.kSyntaxError: kExitSyntax, analysis.kUnreadable: kExitProblem}
+                  analysis.kSyntaxError: kExitSyntax, analysis.kUnreadable: kExitProblem,
+                  analysis.kFailed: kExitProblem}
+# More worker processes than this only cost memory.
+kMaxJobs = 64
 
 # ---- JSON: bytes as strings, losslessly
 
@@ -107,7 +122,8 @@ def JsonLine(logical, error, prefix=''):
     if error is None:
         error_json = 'null'
     else:
-        error_json = '{"message": %s, "line": %d, "column": %d}' % _ErrorFields(logical, error)
+        error_json = ('{"message": %s, "line": %d, "column": %d, "byte_column": %d}'
+                      % _ErrorFields(logical, error))
     return '%s, "defines": %s, "reads": %s, "equivs": %s, "args": %s, "arg_equivs": %s, ' \
         '"bases": %s, "error": %s, "truncated": %s}' % (
             head, _JsonStrings(names), _JsonStrings(reads), _JsonPairs(equivs),
@@ -116,8 +132,8 @@ def JsonLine(logical, error, prefix=''):
 
 
 def _ErrorFields(logical, error):
-    line, column, message = analysis.ErrorLocation(logical, error)
-    return JsonString(message), line, column
+    line, column, byte_column, message = analysis.ErrorPosition(logical, error)
+    return JsonString(message), line, column, byte_column
 
 
 def _Null(value):
@@ -125,6 +141,22 @@ def _Null(value):
 
 
 # ---- text
+
+_kPathEscapes = re.compile(br'[\x00-\x1f\x7f\\]')
+_kNamedEscapes = {b'\n': b'\\n', b'\r': b'\\r', b'\t': b'\\t', b'\\': b'\\\\'}
+
+
+def EscapePath(path):
+    """A path for the line formats: backslashes and control characters
+    escaped, so that one path stays on one line."""
+    return _kPathEscapes.sub(
+        lambda m: _kNamedEscapes.get(m.group()) or b'\\x%02x' % ord(m.group()), path)
+
+
+def _ErrorText(logical, error):
+    line, column, _, message = analysis.ErrorPosition(logical, error)
+    return b'%d:%d: %s' % (line, column, message)
+
 
 def _FirstLine(text):
     return text.split(b'\n', 1)[0].rstrip(b'\r\n').split(b'\r', 1)[0]
@@ -151,7 +183,7 @@ def TextBlock(path, logical, error):
               (b'arg equivs', _Pairs(arg_equivs)), (b'bases', b', '.join(bases))]
     lines = [b'    %s: %s\n' % (label, value) for label, value in fields if value]
     if error is not None:
-        lines.append(b'    error: %d:%d: %s\n' % analysis.ErrorLocation(logical, error))
+        lines.append(b'    error: %s\n' % _ErrorText(logical, error))
     if logical.fTruncated:
         lines.append(kTruncatedText)
     return b'%s:%d: [%s] %s\n' % (path, logical.fFirstLine + 1, analysis.KindName(logical.fKind),
@@ -174,12 +206,16 @@ def _PathBytes(path):
     return path.encode('utf-8') if isinstance(path, unicode) else path
 
 
+kAnalyzed = (analysis.kOk, analysis.kSyntaxError)
+
+
 def Report(result, options):
     """(output bytes, problem line or None, logical lines, syntax errors, status) of a FileAnalysis."""
     path = _PathBytes(result.path)
+    line_path = EscapePath(path)
     problem = None
     if result.problem is not None:
-        problem = '%s: %s: %s\n' % (path, 'note' if result.status == analysis.kSkipped
+        problem = '%s: %s: %s\n' % (line_path, 'note' if result.status == analysis.kSkipped
                                     else 'error', result.problem)
     notes = ''.join([kTruncatedNote % (path, l.fFirstLine + 1) for l in result.logicals
                      if l.fTruncated])
@@ -191,13 +227,18 @@ def Report(result, options):
     errors = sum(1 for e in result.errors if e is not None)
     fmt = options.fmt
     if options.errors_only and fmt == 'text':
-        out = b''.join(b'%s:%d:%d: %s\n' % ((path,) + analysis.ErrorLocation(l, e))
-                       for l, e in pairs)
+        out = b''.join(b'%s:%s\n' % (line_path, _ErrorText(l, e)) for l, e in pairs)
     elif fmt == 'text':
-        out = b''.join([TextBlock(path, l, e) for l, e in pairs])
+        head = b'%s: version %s\n' % (line_path, result.version) if result.status in kAnalyzed else b''
+        out = head + b''.join([TextBlock(line_path, l, e) for l, e in pairs])
     elif fmt == 'jsonl':
         prefix = '"path": %s, "version": %s, ' % (JsonString(path), _Null(result.version))
         out = b''.join([JsonLine(l, e, prefix) + '\n' for l, e in pairs])
+        # A file with no logical line still gets a record, so that a reader
+        # sees every file (with --errors-only, those not analyzed).
+        if not result.logicals and not (options.errors_only and result.status in kAnalyzed):
+            out = '{%s"status": "%s", "problem": %s}\n' % (prefix, result.status,
+                                                           _Null(result.problem))
     else:
         out = '{"path": %s, "version": %s, "status": "%s", "problem": %s, "lines": [%s]}' % (
             JsonString(path), _Null(result.version), result.status, _Null(result.problem),
@@ -206,29 +247,143 @@ def Report(result, options):
 
 
 def ReportTask(task, options):
-    """Analyzes one task of the run and reports it (see Report)."""
+    """Analyzes one task of the run and reports it (see Report); a failure of
+    the analysis is that file's status kFailed, not the run's end."""
     path, status, problem, text = task
-    if problem is not None:
-        result = analysis.FileAnalysis(path, status=status, problem=problem)
-    elif text is not None:
-        result = analysis.AnalyzeText(text, options.version, path, options.checks)
-    else:
-        result = analysis.AnalyzeFile(path, options.version, options.checks)
-    return Report(result, options)
+    try:
+        if problem is not None:
+            result = analysis.FileAnalysis(path, status=status, problem=problem)
+        elif text is not None:
+            result = analysis.AnalyzeText(text, options.version, path, options.checks)
+        else:
+            result = analysis.AnalyzeFile(path, options.version, options.checks)
+        return Report(result, options)
+    except analysis.AnalysisFailure as e:
+        why = str(e)
+    except MemoryError:
+        why = 'out of memory'
+    return Report(analysis.FileAnalysis(path, status=analysis.kFailed, problem=why), options)
 
 
-_gOptions = None
-
-
-def _WorkerInit(options):
-    global _gOptions
-    _gOptions = options
-    import signal
+def _Worker(tasks, results, options):
+    """A worker process: reports the (index, task) pairs it receives until None."""
     signal.signal(signal.SIGINT, signal.SIG_IGN)
+    while True:
+        item = tasks.recv()
+        if item is None:
+            return
+        index, task = item
+        results.send((index, ReportTask(task, options)))
 
 
-def _WorkerReport(task):
-    return ReportTask(task, _gOptions)
+class WorkerPool(object):
+    """Reports tasks in worker processes, one task per worker at a time.
+
+    A worker that dies (killed for memory, say) is noticed by the end of its
+    result pipe; the task it held is reported as failed and a new worker
+    takes its place.
+    """
+
+    def __init__(self, count, options):
+        import multiprocessing
+        self._mp = multiprocessing
+        self.options = options
+        self.count = count
+        self.workers = []       # [process, task pipe, result pipe, index held or None]
+
+    def _Start(self):
+        tasks_out, tasks_in = self._mp.Pipe(False)
+        results_out, results_in = self._mp.Pipe(False)
+        process = self._mp.Process(target=_Worker, args=(tasks_out, results_in, self.options))
+        process.daemon = True
+        process.start()
+        # Only the worker holds these ends: its death closes the result pipe.
+        tasks_out.close()
+        results_in.close()
+        worker = [process, tasks_in, results_out, None]
+        self.workers.append(worker)
+        return worker
+
+    def Reports(self, tasks):
+        """Yields the report of each task, in the order of tasks."""
+        pending = iter(enumerate(tasks))
+        done = {}
+        following = 0
+        for _ in range(self.count):
+            self._Start()
+        busy = 0
+        for worker in self.workers:
+            busy += self._Give(worker, pending)
+        while True:
+            while following in done:
+                yield done.pop(following)
+                following += 1
+            if not busy:
+                break
+            ready = select.select([w[2] for w in self.workers if w[3] is not None], [], [])[0]
+            for worker in [w for w in self.workers if w[2] in ready]:
+                index = worker[3]
+                try:
+                    got, report = worker[2].recv()
+                except (EOFError, IOError, OSError):
+                    done[index] = self._Died(worker, tasks[index])
+                    worker = self._Start()
+                else:
+                    done[got] = report
+                worker[3] = None
+                busy -= 1
+                busy += self._Give(worker, pending)
+
+    def _Give(self, worker, pending):
+        """Sends the next task to an idle worker (to a new one if it has died
+        meanwhile); 1 when there was one, else 0."""
+        for index, task in pending:
+            for _ in range(3):
+                try:
+                    worker[1].send((index, task))
+                    break
+                except (IOError, OSError):
+                    self._Discard(worker)
+                    worker = self._Start()
+            else:
+                raise RuntimeError('worker processes die as soon as they start')
+            worker[3] = index
+            return 1
+        return 0
+
+    def _Discard(self, worker):
+        """Forgets a dead worker; its exit code."""
+        process = worker[0]
+        self.workers.remove(worker)
+        worker[1].close()
+        worker[2].close()
+        process.join(1)
+        if process.is_alive():
+            process.terminate()
+            process.join()
+        return process.exitcode
+
+    def _Died(self, worker, task):
+        code = self._Discard(worker)
+        how = ('killed by signal %d' % -code if code is not None and code < 0
+               else 'exited with status %s' % code)
+        result = analysis.FileAnalysis(task[0], status=analysis.kFailed,
+                                       problem='the worker process analyzing it died (%s)' % how)
+        return Report(result, self.options)
+
+    def Close(self):
+        for worker in self.workers:
+            try:
+                worker[1].send(None)
+            except (IOError, OSError):
+                pass
+        for worker in self.workers:
+            worker[0].join()
+
+    def Kill(self):
+        for worker in self.workers:
+            if worker[0].is_alive():
+                worker[0].terminate()
 
 
 # ---- the run
@@ -282,29 +437,53 @@ class _Silent(object):
         return False
 
 
-def _Abandon(pool, status):
-    """Stops the run at once: the workers, then this process, with status.
+class _OutputError(Exception):
+    """Standard output cannot be written (closed or full)."""
 
-    Pool.terminate can wait forever on a result queue no one reads; nothing
-    that remains is worth flushing."""
+
+def _Exit(pool, status, err=None, message=None):
+    """Ends the run at once with status: the workers, then this process,
+    after one line of message on standard error (if it can be written).
+    Nothing that remains is worth flushing."""
     if pool is not None:
-        for worker in pool._pool:
-            worker.terminate()
+        pool.Kill()
+    if message is not None:
+        try:
+            err.write('treelens: %s\n' % message)
+            err.flush()
+        except Exception:
+            pass
     os._exit(status)
+
+
+def _ReadStdin(stdin):
+    """(bytes, None) or (None, why not) for standard input."""
+    if stdin is None:
+        return None, 'cannot read standard input: it is closed'
+    try:
+        return analysis.ReadBounded(stdin)
+    except (IOError, OSError) as e:
+        return None, 'cannot read standard input: %s' % (e.strerror or e)
+    except ValueError as e:         # a closed file object
+        return None, 'cannot read standard input: %s' % e
 
 
 def _Tasks(args, stdin):
     """The tasks of a run in output order: (path, status, problem, text or None)."""
     tasks = []
+    folders = [p for p in args.paths if p != '-' and os.path.isdir(p)]
     for path in args.paths:
         if path == '-':
-            tasks.append((args.stdin_filename, analysis.kOk, None, stdin.read()))
+            text, problem = _ReadStdin(stdin)
+            tasks.append((args.stdin_filename, analysis.kOk if problem is None
+                          else analysis.kUnreadable, problem, text))
             continue
         if not os.path.lexists(path):
             tasks.append((path, analysis.kUnreadable, 'cannot read: No such file or directory',
                           None))
             continue
-        for found, status, problem in analysis.IterSourcePaths([path]):
+        for found, status, problem in analysis.IterSourcePaths([path], args.follow_links,
+                                                               roots=folders):
             tasks.append((found, status, problem, None))
     return tasks
 
@@ -312,13 +491,15 @@ def _Tasks(args, stdin):
 def _ParseArgs(argv):
     parser = argparse.ArgumentParser(
         prog='treelens', description=__doc__.split('\n\n')[0],
-        epilog='Exit status: 0 no syntax error, 1 syntax errors, 2 usage error or unreadable path.')
+        epilog='Exit status: 0 no syntax error, 1 syntax errors, 2 usage error, unreadable path, '
+        'failed analysis or output that cannot be written, 130 interrupted.')
     parser.add_argument('paths', nargs='+', metavar='PATH',
                         help='file or folder to analyse, or - for standard input')
     parser.add_argument('--lang', choices=analysis.kVersions + (analysis.kAuto,),
                         default=analysis.kAuto,
                         help='language version of the sources; auto (default) picks per file '
-                        'the newest version with no syntax error')
+                        'the newest version with no syntax error, else the one with the fewest '
+                        'lines in error')
     parser.add_argument('--format', choices=kFormats, default='text',
                         help='output format (default text)')
     parser.add_argument('--errors-only', action='store_true',
@@ -327,10 +508,14 @@ def _ParseArgs(argv):
                         help='report only what the grammar rejects, not the errors CPython finds '
                         'after parsing (targets that cannot be assigned, misplaced arguments, '
                         'return outside a function, ...)')
+    parser.add_argument('--follow-external-links', dest='follow_links', action='store_true',
+                        help='in folders, also follow symlinks that lead outside the folders '
+                        'given (by default they are reported as skipped)')
     parser.add_argument('--stdin-filename', default='-', metavar='NAME',
                         help='the path to report for standard input')
     parser.add_argument('-j', '--jobs', type=int, default=1, metavar='N',
-                        help='analyse files in N processes (output is the same)')
+                        help='analyse files in N processes (output is the same; at most one per '
+                        'file and %d)' % kMaxJobs)
     parser.add_argument('-q', '--quiet', action='store_true',
                         help='no progress bar and no closing summary')
     # Paths may follow options too (treelens a.py --format json b.py).
@@ -344,11 +529,18 @@ def _ParseArgs(argv):
     return args
 
 
+def _StandardStream(name):
+    stream = getattr(sys, name)
+    if stream is None:
+        return None
+    return getattr(stream, 'buffer', stream)
+
+
 def Main(argv=None, stdin=None, stdout=None, stderr=None):
     args = _ParseArgs(argv)
-    stdin = stdin or getattr(sys.stdin, 'buffer', sys.stdin)
-    out = stdout or getattr(sys.stdout, 'buffer', sys.stdout)
-    err = stderr or sys.stderr
+    stdin = stdin or _StandardStream('stdin')
+    out = stdout or _StandardStream('stdout')
+    err = _Errors(stderr or sys.stderr)
     # The analyzer writes a line to sys.stdout when a walk hits its limits;
     # Report notes those lines on standard error with their path and line,
     # so that line is dropped and the output stays parseable.
@@ -359,20 +551,65 @@ def Main(argv=None, stdin=None, stdout=None, stderr=None):
         sys.stdout = saved_stdout
 
 
+class _Output(object):
+    """Standard output; a failure to write is _OutputError."""
+
+    def __init__(self, stream):
+        self.stream = stream
+
+    def write(self, data):
+        try:
+            self.stream.write(data)
+        except (IOError, OSError, ValueError) as e:
+            raise _OutputError(e)
+
+    def flush(self):
+        try:
+            self.stream.flush()
+        except (IOError, OSError, ValueError) as e:
+            raise _OutputError(e)
+
+
+class _Errors(object):
+    """Standard error: a failure to write it is remembered, not raised (the
+    run goes on; its exit status says so)."""
+
+    def __init__(self, stream):
+        self.stream = stream
+        self.failed = False
+
+    def write(self, data):
+        try:
+            self.stream.write(data)
+            self.stream.flush()
+        except Exception:
+            self.failed = True
+
+    def flush(self):
+        pass
+
+    def isatty(self):
+        try:
+            return self.stream.isatty()
+        except Exception:
+            return False
+
+
 def _Run(args, stdin, out, err):
     started = time.time()
-    options = Options(args.lang, args.format, args.errors_only, args.checks)
-    tasks = _Tasks(args, stdin)
-    progress = Progress(len(tasks), _Silent() if args.quiet else err)
     pool = None
-    if args.jobs > 1 and len(tasks) > 1:
-        import multiprocessing
-        pool = multiprocessing.Pool(min(args.jobs, len(tasks)), _WorkerInit, (options,))
-        reports = pool.imap(_WorkerReport, tasks, 1)
-    else:
-        reports = (ReportTask(task, options) for task in tasks)
-    exit_status, lines, errors, files = kExitOk, 0, 0, 0
+    out = _Output(out)
     try:
+        options = Options(args.lang, args.format, args.errors_only, args.checks)
+        tasks = _Tasks(args, stdin)
+        progress = Progress(len(tasks), _Silent() if args.quiet else err)
+        jobs = min(args.jobs, len(tasks), kMaxJobs)
+        if jobs > 1:
+            pool = WorkerPool(jobs, options)
+            reports = pool.Reports(tasks)
+        else:
+            reports = (ReportTask(task, options) for task in tasks)
+        exit_status, lines, errors, files = kExitOk, 0, 0, 0
         if args.format == 'json':
             out.write('{"files": [')
         for i, (text, problem, count, error_count, status) in enumerate(reports):
@@ -386,28 +623,76 @@ def _Run(args, stdin, out, err):
             exit_status = max(exit_status, kExitForStatus[status])
             lines += count
             errors += error_count
-            files += status in (analysis.kOk, analysis.kSyntaxError)
+            files += status in kAnalyzed
             progress.Update(i + 1)
         if args.format == 'json':
             out.write('\n]}\n')
         out.flush()
-    except KeyboardInterrupt:
+        if pool is not None:
+            pool.Close()
         progress.Close()
-        err.write('interrupted\n')
-        _Abandon(pool, 130)
-    except IOError as e:
-        if e.errno != errno.EPIPE:
-            raise
-        _Abandon(pool, kExitProblem)     # standard output was closed (a pager quit)
-    if pool is not None:
-        pool.close()
-        pool.join()
-    progress.Close()
-    if not args.quiet:
-        err.write('%d files, %d logical lines, %d syntax errors, %.2f seconds\n'
-                  % (files, lines, errors, time.time() - started))
+        if not args.quiet:
+            err.write('%d files, %d logical lines, %d syntax errors, %.2f seconds\n'
+                      % (files, lines, errors, time.time() - started))
+    except KeyboardInterrupt:
+        _Exit(pool, kExitInterrupted, err, 'interrupted')
+    except _OutputError as e:
+        e = e.args[0]
+        if getattr(e, 'errno', None) == errno.EPIPE:
+            _Exit(pool, kExitProblem)      # the reader has gone (a pager quit, | head)
+        _Exit(pool, kExitProblem, err, 'cannot write the output: %s'
+              % (getattr(e, 'strerror', None) or e))
+    except MemoryError:
+        _Exit(pool, kExitProblem, err, 'out of memory')
+    if err.failed:
+        return max(exit_status, kExitProblem)
     return exit_status
 
 
+class _ClosedStream(object):
+    """A standard stream whose descriptor was closed when the run began."""
+
+    def _Fail(self, *args):
+        raise IOError(errno.EBADF, 'Bad file descriptor')
+
+    read = write = flush = _Fail
+
+    def isatty(self):
+        return False
+
+
+def _ClosedStandardStreams():
+    """Standard descriptors that are closed, each then opened on the null
+    device so that no file the run opens takes its number."""
+    closed = []
+    for fd in (0, 1, 2):
+        try:
+            os.fstat(fd)
+        except OSError:
+            closed.append(fd)
+    for fd in closed:
+        if os.open(os.devnull, os.O_RDWR) != fd:
+            break
+    return closed
+
+
+def Run():
+    """The command line's entry: Main, and an exit that flushes nothing more
+    (what could not be written has already been reported)."""
+    closed = _ClosedStandardStreams()
+    streams = [_ClosedStream() if fd in closed else None for fd in (0, 1, 2)]
+    try:
+        status = Main(None, *streams)
+    except KeyboardInterrupt:
+        _Exit(None, kExitInterrupted, sys.stderr, 'interrupted')
+    except MemoryError:
+        _Exit(None, kExitProblem, sys.stderr, 'out of memory')
+    try:
+        sys.stdout.flush()
+    except Exception:
+        status = max(status, kExitProblem)
+    os._exit(status)
+
+
 if __name__ == '__main__':
-    sys.exit(Main())
+    Run()

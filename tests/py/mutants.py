@@ -217,9 +217,9 @@ def Ours(version, source, checks=True):
     """The analyzer's first error in a source: None or [message, line, column]."""
     from pysource import analysis
     result = analysis.AnalyzeText(source, version, checks=checks)
-    for logical, error in zip(result.logicals, result.errors):
-        if error is not None:
-            return [error.msg, logical.fFirstLine + (error.lineno or 1), error.offset]
+    for error in result.errors:
+        if error is not None:       # located in the source as CPython locates it
+            return [error.msg, error.lineno, error.offset]
     return None
 
 

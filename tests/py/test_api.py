@@ -86,7 +86,10 @@ class VersionTest(unittest.TestCase):
                  (b'print(x, end="")\nx = 1_0\n', '3.8', []),
                  (b'async = 1\nx = f"{async}"\n', '3.6', []),
                  (b'print x\ny = f"{x}"\n', '3.8', [(1, 7)]),
-                 (b'if x\n', '3.8', [(1, 5)])]
+                 (b'if x\n', '3.8', [(1, 5)]),
+                 # No version parses it: the fewest lines in error, the newest on a tie.
+                 (b'print "x"\ny = 1\nx = (\n', '2.7', [(3, 6)]),
+                 (b'async = 1\nx = f"{async}"\ny = 1L\n', '3.6', [(3, 5)])]
         for text, version, errors in cases:
             result = analysis.AnalyzeText(text)
             self.assertEqual((result.version, Errors(text, result.version)), (version, errors), text)
@@ -153,7 +156,8 @@ class ViewTest(unittest.TestCase):
                          ([b'self', b'a'], [(b'a', symbolinfo.BuildLiteralInfo(b'int', b'1'))]))
         self.assertEqual((views[4]['defines'], views[4]['reads'], views[4]['equivs']),
                          ([b'x'], [b'y'], [(b'x', b'y')]))
-        self.assertEqual(views[5]['error'], {'message': 'invalid syntax', 'line': 6, 'column': 13})
+        self.assertEqual(views[5]['error'], {'message': 'invalid syntax', 'line': 6, 'column': 13,
+                                             'byte_column': 13})
         self.assertEqual((views[5]['defines'], views[5]['reads']), ([], []))
 
     def testReadsAreTheGetInfos(self):
@@ -178,6 +182,25 @@ class ViewTest(unittest.TestCase):
                 by_hand = [analysis.LineView(l, impl.AnalyzeSingleLogical(
                     l, version != '2.7' and utils.InAsyncDef(l))) for l in logicals]
                 self.assertEqual(analysis.AnalyzeText(text, version).Lines(), by_hand, path)
+
+    def testErrorsLocatedInTheFileAsCPythonLocatesThem(self):
+        # text, version, (lineno, offset, text) of CPython's error, view's (column, byte column)
+        cases = [(b'x = 1\ns = "\xc3\xa9\xc3\xa9" +  = 2\n', '3.8',
+                  (2, 13, b's = "\xc3\xa9\xc3\xa9" +  = 2\n'), (13, 15)),
+                 # Python 2 reads a file without a coding cookie as ASCII.
+                 (b'# coding: utf-8\ns = "\xc3\xa9\xc3\xa9" +  = 2\n', '2.7',
+                  (2, 15, b's = "\xc3\xa9\xc3\xa9" +  = 2\n'), (13, 15)),
+                 # The checks after parsing keep CPython's offset (3.6: 0-based bytes).
+                 (b'y = (1,\n     2); f() = 1\n', '3.6', (2, 9, b'     2); f() = 1\n'), (10, 10))]
+        for text, version, located, columns in cases:
+            for path in ('pkg/m.py', None):
+                result = analysis.AnalyzeText(text, version, path)
+                error = [e for e in result.errors if e is not None][0]
+                self.assertEqual((error.filename, error.lineno, error.offset, error.text),
+                                 (path or '<string>',) + located, (text, version))
+            view = [v['error'] for v in result.Lines() if v['error']][0]
+            self.assertEqual((view['line'], view['column'], view['byte_column']),
+                             (located[0],) + columns)
 
     def testTextsThatAreNotSource(self):
         result = analysis.AnalyzeText(b'x = 1\ny = "\0"\n')

@@ -4,9 +4,12 @@ import json
 import os
 import re
 import shutil
+import signal
 import subprocess
 import sys
 import tempfile
+import threading
+import time
 import unittest
 
 from tests.py import support
@@ -63,7 +66,7 @@ class CliTest(unittest.TestCase):
         bad = self.Write('bad.py', b'x = 1\nif x\n')
         status, out, err = Treelens(good)
         self.assertEqual(status, 0, err)
-        self.assertEqual(out, good + b':1: [stmt] import os\n    defines: os\n    equivs: os = '
+        self.assertEqual(out, good + b': version 3.8\n' + good + b':1: [stmt] import os\n    defines: os\n    equivs: os = '
                          b':i:os\n' + good + b':3: [stmt] x = y\n    defines: x\n    reads: y\n'
                          b'    equivs: x = y\n')
         self.assertEqual(err, b'1 files, 3 logical lines, 0 syntax errors, %s seconds\n'
@@ -104,7 +107,7 @@ class CliTest(unittest.TestCase):
                  'utf8.py': b'\xef\xbb\xbfs = "\xf0\x9f\x98\x80\xe2\x82\xac"\nu"\\u00e9"\n',
                  'empty.py': b'',
                  'long.py': b'x = [' + b'1, ' * 350000 + b']\n',
-                 'mixed.py': b'\tif x:\r  y = (1,\\\n 2)\r# c\n\n'}
+                 'mixed.py': b'if x:\r\ty = (1,\\\n 2)\r# c\n\n'}
         paths = dict((name, self.Write(name, text)) for name, text in texts.items())
         status, out, err = Treelens('--format', 'json', '-q', self.tmp)
         self.assertEqual(status, 0, err)
@@ -119,7 +122,9 @@ class CliTest(unittest.TestCase):
             bom = 3 if text.startswith(b'\xef\xbb\xbf') else 0
             self.assertEqual(b''.join(Lossless(l['text']) for l in entry['lines']), text[bom:], name)
             self.assertEqual([l for l in lines if l['path'] == paths[name]],
-                             [dict(l, path=paths[name], version='3.8') for l in entry['lines']])
+                             [dict(l, path=paths[name], version='3.8') for l in entry['lines']]
+                             or [{'path': paths[name], 'version': '3.8', 'status': 'ok',
+                                  'problem': None}])
         line = [f for f in files if f['path'] == paths['latin1.py']][0]['lines'][1]
         self.assertEqual((line['defines'], line['reads'], line['equivs'], line['error']),
                          (['s'], [], [['s', u':l:string: \'caf\udce9\'']], None))
@@ -131,16 +136,23 @@ class CliTest(unittest.TestCase):
         self.Write('pkg/new.py', b'print(f"{x}")\n')
         self.Write('pkg/new36.py', b'async = 1\n')
         self.Write('pkg/new38.py', b'def f(a, /):\n    if (n := a): return n\n')
+        self.Write('pkg/sub/notes.txt', b'')
+        os.symlink('..', os.path.join(self.tmp, 'pkg', 'sub', 'up'))
         os.symlink('..', os.path.join(self.tmp, 'pkg', 'up'))
         status, out, err = Treelens('--format', 'jsonl', '-q', 'pkg', cwd=self.tmp)
         self.assertEqual(status, 0, err)
         self.assertEqual([(l['path'], l['version']) for l in map(json.loads, out.splitlines())],
                          [('pkg/new.py', '3.8'), ('pkg/new36.py', '3.6'), ('pkg/new38.py', '3.8'),
-                          ('pkg/new38.py', '3.8'), ('pkg/old.py', '2.7')])
+                          ('pkg/new38.py', '3.8'), ('pkg/old.py', '2.7'), ('pkg/sub/up', None),
+                          ('pkg/up', None)])
         for lang, status_wanted in (('3.7', 1), ('3.8', 0)):
             self.assertEqual(Treelens('-q', '--lang', lang, 'pkg/new38.py', cwd=self.tmp)[0], status_wanted, lang)
-        self.assertEqual(err, b'pkg/up/pkg: note: symlink loop: folder already being searched, '
+        self.assertEqual(err, b'pkg/sub/up: note: symlink loop: folder already being searched, '
+                         b'not followed\npkg/up: note: symlink to outside the folders searched, '
                          b'not followed\n')
+        status, out, err = Treelens('--format', 'jsonl', '-q', '--follow-external-links', 'pkg',
+                                    cwd=self.tmp)
+        self.assertIn(b'{"path": "pkg/up/pkg", "version": null, "status": "skipped", ', out)
 
     def testParallelOutputIsIdentical(self):
         lib = support.StdlibDir('2.7')
@@ -154,12 +166,127 @@ class CliTest(unittest.TestCase):
             if fmt == 'jsonl':
                 self.CheckRoundTrip(one[1])
 
+    def testEveryFileHasARecordOnItsOwnLines(self):
+        self.Write('empty.py', b'')
+        self.Write('bin.py', b'\0')
+        self.Write('new\nline.py', b'x = 1\ns = "\xc3\xa9\xc3\xa9" +  = 2\n')
+        self.Write('old.py', b'print "x"\ny = 1\nx = (\n')
+        names = ['bin.py', 'empty.py', 'new\nline.py', 'old.py']
+        paths = [os.path.join(self.tmp, n) for n in names]
+        escaped = [p.replace(b'\n', b'\\n') for p in paths]
+        # --format, --errors-only: what the output holds
+        cases = [('jsonl', False, [
+                     {'path': paths[0], 'version': None, 'status': 'unreadable',
+                      'problem': 'not Python source: NUL byte at line 1, column 1'},
+                     {'path': paths[1], 'version': '3.8', 'status': 'ok', 'problem': None},
+                     (paths[2], 1, None), (paths[2], 2, (13, 15)),
+                     (paths[3], 1, None), (paths[3], 2, None), (paths[3], 3, (6, 6))]),
+                 ('jsonl', True, [{'path': paths[0], 'version': None, 'status': 'unreadable',
+                                   'problem': 'not Python source: NUL byte at line 1, column 1'},
+                                  (paths[2], 2, (13, 15)), (paths[3], 3, (6, 6))]),
+                 ('text', True, [escaped[2] + b':2:13: invalid syntax', escaped[3] + b':3:6: invalid syntax']),
+                 ('text', False, [escaped[1] + b': version 3.8', escaped[2] + b': version 3.8',
+                                  escaped[2] + b':1: [stmt] x = 1', b'    defines: x',
+                                  b'    equivs: x = :l:int: 1',
+                                  escaped[2] + b':2: [stmt] s = "\xc3\xa9\xc3\xa9" +  = 2',
+                                  b'    error: 2:13: invalid syntax', escaped[3] + b': version 2.7',
+                                  escaped[3] + b':2: [stmt] y = 1', b'    defines: y',
+                                  b'    equivs: y = :l:int: 1', escaped[3] + b':3: [stmt] x = (',
+                                  b'    error: 3:6: invalid syntax'])]
+        for fmt, errors_only, wanted in cases:
+            status, out, err = Treelens('-q', '--format', fmt, self.tmp,
+                                        *(['--errors-only'] if errors_only else []))
+            self.assertEqual(status, 2, err)
+            self.assertEqual(err, escaped[0] + b': error: not Python source: NUL byte at line 1, column 1\n')
+            if fmt == 'text':
+                self.assertEqual(out.splitlines(), wanted)
+                continue
+            got = []
+            for record in map(json.loads, out.splitlines()):
+                if 'line' not in record:
+                    got.append(record)
+                    continue
+                error = record['error'] and (record['error']['column'], record['error']['byte_column'])
+                got.append((record['path'], record['line'], error))
+            self.assertEqual(got, wanted, (fmt, errors_only))
+
+    def testDeadWorkersFilesFailTheRestIsDone(self):
+        for name in ('a.py', 'die.py', 'm.py', 'oom.py', 'z.py'):
+            self.Write('src/' + name, b'x = 1\n')
+        script = self.Write('run.py', b"""
+import os, signal, sys
+from pysource import analysis, cli
+report, analyze = cli.ReportTask, analysis.AnalyzeText
+def Dying(task, options):
+    if task[0].endswith('die.py'):
+        os.kill(os.getpid(), signal.SIGKILL)
+    return report(task, options)
+def Exhausted(text, version, path, checks):
+    if path.endswith('oom.py'):
+        raise MemoryError
+    return analyze(text, version, path, checks)
+cli.ReportTask, analysis.AnalyzeText = Dying, Exhausted
+sys.exit(cli.Main(sys.argv[1:]))
+""")
+        env = dict(os.environ, PYTHONPATH=support.kRoot)
+        proc = subprocess.Popen([sys.executable, script, '-q', '-j', '2', '--format', 'jsonl',
+                                 os.path.join(self.tmp, 'src')], stdout=subprocess.PIPE, stderr=subprocess.PIPE, env=env)
+        watchdog = threading.Timer(120, proc.kill)      # a hung run fails, not hangs the suite
+        watchdog.start()
+        out, err = proc.communicate()
+        watchdog.cancel()
+        self.assertEqual(proc.returncode, 2, err)
+        got = [(os.path.basename(r['path']), r.get('status', 'line')) for r in map(json.loads, out.splitlines())]
+        self.assertEqual(got, [('a.py', 'line'), ('die.py', 'failed'), ('m.py', 'line'),
+                               ('oom.py', 'failed'), ('z.py', 'line')])
+        self.assertEqual([line.split(b': ', 1)[1] for line in err.splitlines()],
+                         [b'error: the worker process analyzing it died (killed by signal 9)',
+                          b'error: out of memory'])
+
+    def testBrokenStreamsEndWithOneLineAndStatus2(self):
+        big = self.Write('big.py', b'x = y\n' * 20000)
+        good = self.Write('good.py', b'x = 1\n')
+        cli_ = '"%s" -m pysource.cli' % sys.executable
+        # shell command, exit status, standard error
+        cases = [('%s -q %s > /dev/full' % (cli_, big), 2,
+                  b'treelens: cannot write the output: No space left on device\n'),
+                 ('%s -q %s >&-' % (cli_, good), 2,
+                  b'treelens: cannot write the output: Bad file descriptor\n'),
+                 ('%s -q - <&-' % cli_, 2, b'-: error: cannot read standard input: Bad file descriptor\n'),
+                 ('%s %s 2>/dev/full' % (cli_, good), 2, None),
+                 ('%s %s 2>&-' % (cli_, good), 2, None),
+                 ('%s -q %s 2>&- && echo clean >&2' % (cli_, good), 0, b'clean\n'),
+                 # The reader went away: quietly.
+                 ('%s -q -j 2 %s %s | head -c 10 > /dev/null; exit ${PIPESTATUS[0]}' % (cli_, big, big),
+                  2, b'')]
+        env = dict(os.environ, PYTHONPATH=support.kRoot)
+        for command, wanted, wanted_err in cases:
+            proc = subprocess.Popen(['bash', '-c', '( %s ) 2>&1 >/dev/null' % command if wanted_err is None
+                                     else command], stdout=subprocess.PIPE,
+                                    stderr=subprocess.PIPE, env=env)
+            out, err = proc.communicate()
+            self.assertEqual(proc.returncode, wanted, (command, err))
+            if wanted_err is not None:
+                self.assertEqual(err, wanted_err, command)
+            self.assertNotIn(b'Traceback', out + err)
+        # An interrupt while standard input is read.
+        proc = subprocess.Popen([sys.executable, '-m', 'pysource.cli', '-q', '-'], env=env,
+                                stdin=subprocess.PIPE, stdout=subprocess.PIPE, stderr=subprocess.PIPE)
+        proc.stdin.write(b'x = 1\n')
+        proc.stdin.flush()
+        time.sleep(3)           # (until it reads: the interpreter has started)
+        proc.send_signal(signal.SIGINT)
+        out, err = proc.communicate()
+        self.assertEqual((proc.returncode, err), (130, b'treelens: interrupted\n'))
+
     def CheckRoundTrip(self, jsonl):
         """Every file's line texts, in order, give back the file."""
         texts = {}
         for line in jsonl.splitlines():
             entry = json.loads(line)
-            texts.setdefault(entry['path'], []).append(Lossless(entry['text']))
+            texts.setdefault(entry['path'], [])
+            if 'line' in entry:         # not the record of a file with no line
+                texts[entry['path']].append(Lossless(entry['text']))
         for path, parts in texts.items():
             text = support.ReadBytes(path)
             self.assertEqual(b''.join(parts), text[3:] if text[:3] == b'\xef\xbb\xbf' else text,

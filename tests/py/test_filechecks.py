@@ -81,7 +81,7 @@ def FirstError(version, source, checks=True):
     result = analysis.AnalyzeText(source, version, path='t.py', checks=checks)
     for logical, error in zip(result.logicals, result.errors):
         if error is not None:
-            return [error.msg, logical.fFirstLine + (error.lineno or 1), error.offset], type(error).__name__
+            return [error.msg, error.lineno, error.offset], type(error).__name__
     return None, None
 
 

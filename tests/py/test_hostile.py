@@ -9,10 +9,12 @@ import gc
 import os
 import random
 import re
+import logging
 import select
 import subprocess
 import sys
 import tempfile
+import threading
 import time
 import unittest
 
@@ -20,7 +22,7 @@ from tests.py import support
 
 try:
     from pysource import _fastaccess as fa
-    from pysource import logicalinspect, optpgen
+    from pysource import analysis, logicalinspect, optpgen
     from pysource import treelens as tl
 except ImportError as _exc:  # native modules not built
     tl = None
@@ -327,6 +329,162 @@ kDunders = frozenset(['__init__', '__setstate__', '__reduce__', '__repr__', '__l
 
 # An argument count named by a TypeError or a __setstate__ ValueError.
 kArityMessage = re.compile(r'(?:exactly|takes|needs|expected|at most) (\d+) (?:positional )?(?:arg|values)')
+
+
+class _Captured(logging.Handler):
+    def __init__(self):
+        logging.Handler.__init__(self)
+        self.records = []
+
+    def emit(self, record):
+        self.records.append(record)
+
+
+def RemoveTree(top):
+    """Removes a folder tree without recursion (it may be deeper than the stack)
+    and without a child process (a fork right after threads ran may hang)."""
+    stack = [top]
+    while stack:
+        path = stack[-1]
+        entries = [os.path.join(path, n) for n in os.listdir(path)]
+        folders = [e for e in entries if os.path.isdir(e) and not os.path.islink(e)]
+        if folders:
+            stack.extend(folders)
+            continue
+        for entry in entries:
+            os.remove(entry)
+        os.rmdir(stack.pop())
+
+
+class ApiTest(HostileTestBase):
+    """The analysis API under threads, a failing analyzer, and folders that
+    hold what is not a source file."""
+
+    def setUp(self):
+        HostileTestBase.setUp(self)
+        self.tmp = tempfile.mkdtemp()
+
+    def tearDown(self):
+        RemoveTree(self.tmp)
+
+    def testThreadsGetTheSingleThreadedResult(self):
+        text = b''.join(b'def f%d(a, b=x%d):\n    y = a + b\n    return [z for z in y]\n'
+                        b'class C%d(B): pass\nq = = 1\n' % (i, i, i) for i in range(20))
+        wanted = analysis.AnalyzeText(text, '3.6').Lines()
+        got = []
+
+        def Run():
+            for _ in range(4):
+                got.append(analysis.AnalyzeText(text, '3.6').Lines() == wanted)
+
+        def Yield(frame, event, arg):
+            # Hand the interpreter to another thread whenever the analyzer
+            # calls back into Python code (the parse error of 'q = = 1').
+            if event == 'call' and frame.f_globals.get('__name__') in ('pysource.optpgen',
+                                                                     'pysource.logicalinspect'):
+                time.sleep(0.0001)
+        threading.setprofile(Yield)
+        try:
+            threads = [threading.Thread(target=Run) for _ in range(4)]
+            for thread in threads:
+                thread.start()
+            for thread in threads:
+                thread.join()
+        finally:
+            threading.setprofile(None)
+        self.assertEqual(got, [True] * 16)
+
+    def testAnalyzerFailureIsNeverACleanLine(self):
+        # The native analyzer reports a failure and returns None; the API must
+        # not take that for a line with no error and nothing recorded.
+        def Fail(logical):
+            raise RuntimeError('host failed')
+        handler = _Captured()
+        logger = logging.getLogger('pysource')
+        logger.addHandler(handler)
+        saved, logicalinspect.TextFromTokens = logicalinspect.TextFromTokens, Fail
+        path = os.path.join(self.tmp, 'bad.py')
+        with open(path, 'wb') as f:
+            f.write(b'x = 1\ny = = 1\n')
+        try:
+            e = Raises(self, analysis.AnalysisFailure, analysis.AnalyzeText, b'x = 1\ny = = 1\n', '3.6')
+            self.assertIn('line 2', str(e))
+            self.assertIn('host failed', str(e))
+            result = analysis.AnalyzeFile(path, '3.6')
+            self.assertEqual((result.status, result.logicals), (analysis.kFailed, []))
+        finally:
+            logicalinspect.TextFromTokens = saved
+            logger.removeHandler(handler)
+        self.assertEqual(len(handler.records), 2)      # reported all the same
+        self.assertEqual(analysis.AnalyzeFile(path, '3.6').SyntaxErrors(), [(2, 5, 'invalid syntax')])
+
+    def testOnlyRegularFilesBoundedInSizeAreRead(self):
+        os.mkfifo(os.path.join(self.tmp, 'fifo.py'))
+        os.symlink('/dev/zero', os.path.join(self.tmp, 'zero.py'))
+        with open(os.path.join(self.tmp, 'sparse.py'), 'wb') as f:
+            f.truncate(analysis.kMaxSourceBytes + 1)
+        with open(os.path.join(self.tmp, 'ok.py'), 'wb') as f:
+            f.write(b'x = 1\n')
+        # (These would block forever, or read without bound, if opened plainly.)
+        got = [(os.path.basename(r.path), r.status, r.problem)
+               for r in analysis.AnalyzeFolder(self.tmp, follow_links=True)]
+        self.assertEqual(got, [
+            ('fifo.py', analysis.kUnreadable, 'cannot read: not a regular file (a FIFO)'),
+            ('ok.py', analysis.kOk, None),
+            ('sparse.py', analysis.kUnreadable,
+             'too large: %d bytes or more (the limit is %d bytes)'
+             % (analysis.kMaxSourceBytes + 1, analysis.kMaxSourceBytes)),
+            ('zero.py', analysis.kUnreadable,
+             'cannot read: not a regular file (a character device)')])
+
+    def testDeepTreesAndAnyNames(self):
+        deep = os.path.join(self.tmp, 'deep')
+        os.mkdir(deep)
+        fd = os.open(deep, os.O_RDONLY)
+        cwd = os.getcwd()
+        try:
+            os.chdir(deep)
+            for _ in range(1100):           # deeper than the interpreter's recursion
+                os.mkdir('d')
+                os.chdir('d')
+            with open('x.py', 'wb') as f:
+                f.write(b'x = 1\n')
+        finally:
+            os.chdir(cwd)
+            os.close(fd)
+        with open(os.path.join(self.tmp, b'\xff\n.py'), 'wb') as f:
+            f.write(b'y = 2\n')
+        got = [(r.path, r.status) for r in analysis.AnalyzeFolder(self.tmp.decode('ascii'))]
+        self.assertEqual(got, [(os.path.join(self.tmp.decode('ascii'), u'deep', *[u'd'] * 1100)
+                                + u'/x.py', analysis.kOk),
+                               (os.path.join(self.tmp, b'\xff\n.py'), analysis.kOk)])
+        self.assertEqual(map(type, [p for p, _ in got]), [unicode, bytes])
+
+    def testSymlinksStayWithinTheFoldersGiven(self):
+        inside, outside = os.path.join(self.tmp, 'in'), os.path.join(self.tmp, 'out')
+        os.makedirs(os.path.join(inside, 'sub'))
+        os.mkdir(outside)
+        with open(os.path.join(outside, 'secret.py'), 'wb') as f:
+            f.write(b'password = "x"\n')
+        with open(os.path.join(inside, 'sub', 'm.py'), 'wb') as f:
+            f.write(b'm = 1\n')
+        os.symlink(os.path.join(outside, 'secret.py'), os.path.join(inside, 'a.py'))
+        os.symlink(outside, os.path.join(inside, 'b'))
+        os.symlink(os.path.join(inside, 'sub', 'm.py'), os.path.join(inside, 'c.py'))
+        os.symlink('sub', os.path.join(inside, 'd'))
+        note = 'symlink to outside the folders searched, not followed'
+        for follow, wanted in (
+                (False, [('a.py', analysis.kSkipped, note), ('b', analysis.kSkipped, note),
+                         ('c.py', analysis.kOk, None), ('d/m.py', analysis.kOk, None)]),
+                (True, [('a.py', analysis.kOk, None), ('b/secret.py', analysis.kOk, None),
+                        ('c.py', analysis.kOk, None), ('d/m.py', analysis.kOk, None)])):
+            got = [(os.path.relpath(r.path, inside), r.status, r.problem)
+                   for r in analysis.AnalyzeFolder(inside, follow_links=follow)]
+            self.assertEqual(got, wanted, follow)
+        # Both folders given: a link from one into the other is within them.
+        self.assertEqual([(os.path.relpath(p, self.tmp), s) for p, s, _ in
+                          analysis.IterSourcePaths([inside, outside])][:2],
+                         [('in/a.py', analysis.kOk), ('in/b/secret.py', analysis.kOk)])
 
 
 def _NativeCallables(obj):

@@ -218,6 +218,7 @@ int analyzer_clear(PyObject *Self) {
   Py_CLEAR(A->NodeWalker);
   Py_CLEAR(A->TypeHintWalker);
   Py_CLEAR(A->FStringSupport);
+  Py_CLEAR(A->LastFailure);
   return 0;
 }
 
@@ -313,6 +314,8 @@ PyObject *orNone(PyObject *O) {
 PyObject *analyzer_getNodeWalker(PyObject *Self, void *) { return orNone(self(Self)->NodeWalker); }
 PyObject *analyzer_getTypeHintWalker(PyObject *Self, void *) { return orNone(self(Self)->TypeHintWalker); }
 PyObject *analyzer_getSyntaxChecks(PyObject *Self, void *) { return PyBool_FromLong(self(Self)->SyntaxChecks); }
+PyObject *analyzer_getFailures(PyObject *Self, void *) { return PyInt_FromSsize_t(self(Self)->Failures); }
+PyObject *analyzer_getLastFailure(PyObject *Self, void *) { return orNone(self(Self)->LastFailure); }
 
 PyGetSetDef AnalyzerGetSets[] = {
     {const_cast<char *>("_fNodeWalker"), analyzer_getNodeWalker, nullptr,
@@ -321,10 +324,14 @@ PyGetSetDef AnalyzerGetSets[] = {
      const_cast<char *>("the type-hint walker"), nullptr},
     {const_cast<char *>("fSyntaxChecks"), analyzer_getSyntaxChecks, nullptr,
      const_cast<char *>("whether lines are also checked as CPython checks them after parsing"), nullptr},
+    {const_cast<char *>("fFailures"), analyzer_getFailures, nullptr,
+     const_cast<char *>("how many unexpected failures were reported and None returned"), nullptr},
+    {const_cast<char *>("fLastFailure"), analyzer_getLastFailure, nullptr,
+     const_cast<char *>("repr of the last such failure's exception, or None"), nullptr},
     {nullptr, nullptr, nullptr, nullptr, nullptr}};
 
 /// The failure paths of AnalyzeSingleLogical, with an exception pending.
-Ref analysisFailed(PyObject *Logical) {
+Ref analysisFailed(AnalyzerObject *A, PyObject *Logical) {
   if (PyErr_ExceptionMatches(Host.ParseError)) {
     FetchedError E;
     Ref Result = Ref::steal(tl::guard<PyObject *>(nullptr, [&] {
@@ -344,6 +351,12 @@ Ref analysisFailed(PyObject *Logical) {
   }
   FetchedError E;
   clearQuietly(Logical);
+  // Counted before reporting: the report runs Python code and may fail.
+  ++A->Failures;
+  PyObject *Repr = PyObject_Repr(E.value());
+  if (!Repr)
+    PyErr_Clear();
+  Py_XSETREF(A->LastFailure, Repr);
   reportException(E);
   return Ref::borrow(Py_None);
 }
@@ -366,7 +379,7 @@ Ref analyzeSingleLogical(AnalyzerObject *A, PyObject *Logical, bool InAsyncDef) 
     inspectSingleLogical(A, Logical, InAsyncDef, false);
     return true;
   });
-  return Ok ? Ref::borrow(Py_None) : analysisFailed(Logical);
+  return Ok ? Ref::borrow(Py_None) : analysisFailed(A, Logical);
 }
 
 void inspectSingleLogical(AnalyzerObject *A, PyObject *Logical, bool InAsyncDef, bool InFString) {

@@ -15,6 +15,11 @@ struct AnalyzerObject {
   PyObject *TypeHintWalker; ///< CTypeHintWalker
   PyObject *FStringSupport; ///< CFStringSupport
   bool SyntaxChecks;        ///< also make CPython's checks after parsing (checks::checkLine)
+  /// Unexpected failures reported and swallowed so far, and the repr of the
+  /// last one's exception (a str, or null): a caller that gets None back can
+  /// tell a failure from a clean line.
+  Py_ssize_t Failures;
+  PyObject *LastFailure;
 };
 
 /// CPGenAnalyzer, the abstract analyzer (base of CPGenParserImpl too).
