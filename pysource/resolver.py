@@ -145,7 +145,7 @@ class Scope(object):
 
     __slots__ = ('kind', 'name', 'line', 'col', 'end_line', 'decorated_line', 'parent',
                  'children', 'bindings', 'references', 'flags', 'scopes', 'binding',
-                 'star_imports', 'uses_locals', '_by_name')
+                 'star_imports', 'uses_locals', 'in_string', '_by_name')
 
     def __init__(self, kind, name, line, col, parent):
         self.kind = kind
@@ -161,6 +161,7 @@ class Scope(object):
         self.binding = None         # the def or class binding that names the scope
         self.star_imports = []
         self.uses_locals = False
+        self.in_string = False      # opened in an f-string's replacement field
         self._by_name = None
         if parent is not None:
             parent.children.append(self)
@@ -299,6 +300,8 @@ class _Reader(object):
         self.record_index = 0
         self.clauses = ()
         self.line = None
+        self.in_string = False      # reading a string annotation: the compiler sees no names
+        self.normalize = not self.py2   # Python 3 identifiers are NFKC-normalized
 
     # -- helpers
 
@@ -306,6 +309,8 @@ class _Reader(object):
         return _kName.match(t) is not None and t not in self.keywords
 
     def Bind(self, scope, name, i, kind, order=None, flag=DEF_LOCAL):
+        if self.normalize and max(name) >= '\x80':
+            name = _Normalize(name)
         line, col = self.line.pos[i] if i < self.line.n else self.line.pos[-1]
         b = Binding(name, kind, line, col, scope,
                     (self.record_index, i if order is None else order), self.record_index,
@@ -316,10 +321,14 @@ class _Reader(object):
         return b
 
     def Use(self, scope, name, i, annotation=False):
+        if self.normalize and max(name) >= '\x80':
+            name = _Normalize(name)
         line, col = self.line.pos[i]
         r = Reference(name, line, col, scope, (self.record_index, i), self.clauses)
         r.annotation = annotation
         scope.references.append(r)
+        if self.in_string:
+            return r
         scope.AddFlag(name, USE)
         if name == 'super' and scope.kind == 'function' and not self.py2:
             scope.AddFlag('__class__', USE)
@@ -392,8 +401,11 @@ class _Reader(object):
                     self.Walrus(scope, t, i)
                 else:
                     self.Use(scope, t, i, annotation)
-            elif annotation and (c in '\'"' or (c in 'rRuUbB' and t[-1:] in '\'"')):
-                self.StringAnnotation(t, i, scope)
+            elif t[-1:] in '\'"':
+                if c in 'fFrR' and 'f' in t[:len(t) - len(t.lstrip('rRfF'))].lower():
+                    self.FString(t, i, scope)
+                elif annotation:
+                    self.StringAnnotation(t, i, scope)
             i += 1
 
     def Args(self, a, b, scope, annotation=False):
@@ -479,6 +491,8 @@ class _Reader(object):
                 if not lambdas:
                     break
                 lambdas -= 1
+            elif lambdas:
+                pass        # a nested lambda's parameters
             elif t in (',', ';', 'for') or t == 'async' and end + 1 < b and \
                     texts[end + 1] == 'for':
                 break
@@ -502,7 +516,9 @@ class _Reader(object):
             scope.AddFlag(name, DEF_GLOBAL)
             self.Bind(target, name, i, kWalrus, flag=DEF_GLOBAL | DEF_LOCAL)
         else:
-            scope.AddFlag(name, DEF_NONLOCAL)
+            # A name the function declares global stays global.
+            declared = target.flags.get(target.Mangle(name) if name[:2] == '__' else name, 0)
+            scope.AddFlag(name, DEF_GLOBAL if declared & DEF_GLOBAL else DEF_NONLOCAL)
             self.Bind(target, name, i, kWalrus)
 
     def Params(self, a, b, outer, inner, annotations=True):
@@ -539,8 +555,17 @@ class _Reader(object):
             t = texts[i]
             if t in ('(', '['):
                 close = match[i]
+                if close + 1 < b and texts[close + 1] in ('.', '(', '['):
+                    # (expression).attribute = ...: what it reads
+                    end = self.FindAtDepth0(close + 1, b, (',',))
+                    self.Expr(i, end, scope)
+                    i = end
+                    continue
                 self.Target(i + 1, min(close, b), scope, kind, order)
                 i = close + 1
+                continue
+            if t == '.':
+                i += 2
                 continue
             if self.IsName(t):
                 j = i + 1
@@ -583,7 +608,9 @@ class _Reader(object):
             self.Expr(1, n, scope)
             return
         if head not in _kCompoundHeads:
-            self.Simple(0, n, scope)
+            for s, e in self.Split(0, n, (';',)):
+                if s < e:
+                    self.Simple(s, e, scope)
             return
         body_scope = scope
         if head in ('def', 'class'):
@@ -708,8 +735,16 @@ class _Reader(object):
             simple = eq == a + 1 and self.IsName(head)
             if simple:
                 self.Bind(scope, head, a, kAnnotated if value < b else kAnnotationOnly, order=b)
+                return
+            inner = a
+            while texts[inner] == '(' and texts[eq - 1 - (inner - a)] == ')':
+                inner += 1
+            if eq - (inner - a) == inner + 1 and self.IsName(texts[inner]):
+                # A parenthesized name: bound when a value is given, else nothing.
+                if value < b:
+                    self.Bind(scope, texts[inner], inner, kAnnotated, order=b)
             else:
-                self.Target(a, eq, scope, kAnnotated, order=b)
+                self.Expr(a, eq, scope)
             return
         parts = self.Split(a, b, ('=',))
         value = parts[-1]
@@ -741,25 +776,52 @@ class _Reader(object):
             return
         self.ParsedNames(body.strip(), i, scope)
 
-    def ParsedNames(self, source, i, scope):
-        logicals = utils.GetLogicalsFromText(source + b'\n')
+    def FString(self, text, i, scope):
+        """Reads the expressions of an f-string's replacement fields, each name
+        placed where it is in the string."""
+        quote = len(text) - len(text.lstrip('rRfFbBuU'))
+        q = 3 if text[quote:quote + 3] in ('\'\'\'', '"""') else 1
+        raw = 'r' in text[:quote].lower()
+        for start, expr in _FStringFields(text, quote + q, len(text) - q, raw):
+            self.ParsedNames(expr, i, scope, False, text[:start])
+
+    def ParsedNames(self, source, i, scope, annotation=True, before_text=None):
+        """Reads the names of an expression held in a string token at i: placed at
+        the string, or where they are in it when before_text is the token's text
+        up to the expression."""
+        logicals = utils.GetLogicalsFromText(b'(' + source + b'\n)\n')
         if not logicals:
             return
         saved = self.line
-        where = saved.pos[i]
+        line0, col0 = saved.pos[i]
         try:
             sub = _Line(logicals[0])
-            sub.pos = [where] * sub.n
+            if before_text is None:
+                sub.pos = [(line0, col0)] * sub.n
+            else:
+                rows = before_text.count(b'\n')
+                base_line = line0 + rows
+                base_col = col0 + len(before_text) if not rows else \
+                    len(before_text) - before_text.rfind(b'\n')
+                sub.pos = [(base_line + l - 1, base_col + c - 2 if l == 1 else c)
+                           for l, c in sub.pos]
+            if annotation and not _LooksLikeExpression(sub.texts, self.keywords):
+                return
             self.line = sub
-            before = len(scope.references)
-            self.Expr(0, sub.n, scope, annotation=True)
-            for r in scope.references[before:]:
-                r.string = True
+            first = len(scope.references)
+            self.in_string = annotation
+            children = len(scope.children)
+            self.Expr(0, sub.n, scope, annotation=annotation)
+            for child in scope.children[children:]:
+                child.in_string = True
+            for r in scope.references[first:]:
+                r.string = annotation
                 r.order = (self.record_index, i)
-        except Exception:   # a string that is not an expression reads nothing
+        except (IndexError, KeyError):   # a string that is not an expression reads nothing
             pass
         finally:
             self.line = saved
+            self.in_string = False
 
 
 class Module(object):
@@ -1288,6 +1350,97 @@ def Resolve(result, stub=None):
     module.future_annotations = reader.future_annotations
     module._Resolve()
     return module
+
+
+def _Normalize(name):
+    """A Python 3 identifier as the compiler keys it: NFKC-normalized."""
+    import unicodedata
+    try:
+        return unicodedata.normalize('NFKC', name.decode('utf-8')).encode('utf-8')
+    except UnicodeError:
+        return name
+
+
+def _LooksLikeExpression(texts, keywords):
+    """False for a string that is prose rather than an expression: two names
+    in a row."""
+    previous = False
+    for t in texts:
+        name = _kName.match(t) is not None and t not in keywords
+        if name and previous:
+            return False
+        previous = name
+    return True
+
+
+def _FStringFields(text, start, end, raw=False):
+    """[(offset, expression text)] of the replacement fields of an f-string's
+    body text[start:end], nested ones in format specs included."""
+    out = []
+    i = start
+    while i < end:
+        c = text[i]
+        if c == '\\' and not raw:
+            if text[i + 1:i + 3] == 'N{':
+                close = text.find('}', i)
+                i = close + 1 if close > 0 else end
+            else:
+                i += 2
+            continue
+        if c == '{':
+            if text[i + 1:i + 2] == '{':
+                i += 2
+                continue
+            i = _FStringField(text, i + 1, end, out)
+            continue
+        i += 1
+    return out
+
+
+def _FStringField(text, i, end, out):
+    """Reads one field from just past its '{'; returns the index past its '}'."""
+    start = i
+    depth = 0
+    quote = None
+    while i < end:
+        c = text[i]
+        if quote:
+            if text.startswith(quote, i):
+                i += len(quote)
+                quote = None
+                continue
+            i += 1
+            continue
+        if c in '\'"':
+            quote = text[i:i + 3] if text[i:i + 3] in ('\'\'\'', '"""') else c
+            i += len(quote)
+            continue
+        if c in '([{':
+            depth += 1
+        elif c in ')]}':
+            if depth:
+                depth -= 1
+            elif c == '}':
+                break
+        elif not depth and (c == '!' and text[i + 1:i + 2] != '=' or c == ':'):
+            break
+        i += 1
+    expr = text[start:i].rstrip()
+    if expr.endswith('=') and expr[-2:-1] not in ('=', '!', '<', '>'):
+        expr = expr[:-1]
+    if expr.strip():
+        out.append((start, expr))
+    if i < end and text[i] == '!':
+        i += 2
+    if i < end and text[i] == ':':
+        # The format spec: literal text with nested fields.
+        i += 1
+        while i < end and text[i] != '}':
+            if text[i] == '{':
+                i = _FStringField(text, i + 1, end, out)
+                continue
+            i += 1
+    return i + 1
 
 
 def _Comment(module, reader, text, line):
