@@ -19,9 +19,18 @@ text.encode('utf-8', 'surrogateescape') gives back the exact bytes.
 --errors-only prints only the syntax errors, as path:line:col: message (the
 column counts bytes from 1); with json or jsonl, only the lines with one.
 
+--check reports what the resolver finds across lines, as
+path:line:col: CODE message: F821 undefined name, F401 unused import, F811
+redefinition of an unused name, F841 unused local variable, F403 star import,
+F405 name that may come from a star import (--select and --ignore take codes;
+a line's "# noqa" or "# noqa: F401" silences it); syntax errors are listed
+among them. With json each file has "diagnostics"; with jsonl each is an
+object with path, line, column, code and message.
+
 Exit status: 0 when every file was analyzed and no line has a syntax error,
-1 when some line has one, 2 for a usage error or a path that cannot be read
-(the other paths are still analyzed). Problems go to standard error.
+1 when some line has one (or --check found something), 2 for a usage error
+or a path that cannot be read (the other paths are still analyzed). Problems
+go to standard error.
 """
 
 from __future__ import print_function
@@ -35,6 +44,7 @@ import sys
 import time
 
 from pysource import analysis
+from pysource import resolver
 
 kFormats = ('text', 'json', 'jsonl')
 kExitOk, kExitSyntax, kExitProblem = 0, 1, 2
@@ -86,8 +96,8 @@ def _JsonPairs(pairs):
     return '[' + ', '.join(['[%s, %s]' % (JsonString(n), JsonString(i)) for n, i in pairs]) + ']'
 
 
-kJsonNothingRecorded = (', "defines": [], "reads": [], "equivs": [], "args": [], '
-                        '"arg_equivs": [], "bases": [], "error": null}')
+kJsonNothingRecorded = (', "defines": [], "defines_at": [], "reads": [], "reads_at": [], '
+                        '"equivs": [], "args": [], "arg_equivs": [], "bases": [], "error": null}')
 
 
 def JsonLine(logical, error, prefix=''):
@@ -97,18 +107,25 @@ def JsonLine(logical, error, prefix=''):
         prefix, logical.fFirstLine + 1, analysis.KindName(logical.fKind),
         JsonString(logical.fLineText))
     info = logical.GetDerivedInfo()
-    if info is None and error is None:
+    if info is None and error is None and logical.fKind not in (1, 2):
         return head + kJsonNothingRecorded
     names, type_equivs, args, arg_equivs, bases = info or analysis.kNoDerivedInfo
     reads, equivs = analysis.SplitReads(type_equivs)
     if error is None:
         error_json = 'null'
+        names, defines_at, reads_at = resolver.LineNames(logical, names, reads)
     else:
         error_json = '{"message": %s, "line": %d, "column": %d}' % _ErrorFields(logical, error)
-    return '%s, "defines": %s, "reads": %s, "equivs": %s, "args": %s, "arg_equivs": %s, ' \
-        '"bases": %s, "error": %s}' % (
-            head, _JsonStrings(names), _JsonStrings(reads), _JsonPairs(equivs),
-            _JsonStrings(args), _JsonPairs(arg_equivs), _JsonStrings(bases), error_json)
+        defines_at, reads_at = [None] * len(names), [None] * len(reads)
+    return '%s, "defines": %s, "defines_at": %s, "reads": %s, "reads_at": %s, "equivs": %s, ' \
+        '"args": %s, "arg_equivs": %s, "bases": %s, "error": %s}' % (
+            head, _JsonStrings(names), _JsonPositions(defines_at), _JsonStrings(reads),
+            _JsonPositions(reads_at), _JsonPairs(equivs), _JsonStrings(args),
+            _JsonPairs(arg_equivs), _JsonStrings(bases), error_json)
+
+
+def _JsonPositions(positions):
+    return '[' + ', '.join(['null' if p is None else '[%d, %d]' % p for p in positions]) + ']'
 
 
 def _ErrorFields(logical, error):
@@ -133,10 +150,13 @@ def _Pairs(pairs):
 def TextBlock(path, logical, error):
     """The text block of one analyzed record, or b'' when it records nothing."""
     info = logical.GetDerivedInfo()
-    if info is None and error is None:
+    if info is None and error is None and logical.fKind not in (1, 2):
         return b''
     names, type_equivs, args, arg_equivs, bases = info or analysis.kNoDerivedInfo
     reads, equivs = analysis.SplitReads(type_equivs)
+    defined = resolver.DefinedName(logical) if error is None else None
+    if defined is not None and defined not in names:
+        names = (defined,) + tuple(names)
     fields = [(b'defines', b', '.join(names)), (b'reads', b', '.join(reads)),
               (b'equivs', _Pairs(equivs)), (b'args', b', '.join(args)),
               (b'arg equivs', _Pairs(arg_equivs)), (b'bases', b', '.join(bases))]
@@ -152,11 +172,15 @@ def TextBlock(path, logical, error):
 class Options(object):
     """What the output of a file depends on."""
 
-    def __init__(self, version, fmt, errors_only, checks=True):
+    def __init__(self, version, fmt, errors_only, checks=True, check=False, select=None,
+                 ignore=None):
         self.version = version
         self.fmt = fmt
         self.errors_only = errors_only
         self.checks = checks
+        self.check = check          # --check: the resolver's diagnostics
+        self.select = select
+        self.ignore = ignore
 
 
 def _PathBytes(path):
@@ -164,7 +188,8 @@ def _PathBytes(path):
 
 
 def Report(result, options):
-    """(output bytes, problem line or None, logical lines, syntax errors, status) of a FileAnalysis."""
+    """(output bytes, problem line or None, logical lines, syntax errors, status,
+    diagnostics) of a FileAnalysis."""
     path = _PathBytes(result.path)
     problem = None
     if result.problem is not None:
@@ -175,7 +200,18 @@ def Report(result, options):
         pairs = [(l, e) for l, e in pairs if e is not None]
     errors = sum(1 for e in result.errors if e is not None)
     fmt = options.fmt
-    if options.errors_only and fmt == 'text':
+    diagnostics = []
+    if options.check and result.status in (analysis.kOk, analysis.kSyntaxError):
+        diagnostics = resolver.Resolve(result).Diagnostics(options.select, options.ignore)
+    if options.check and fmt == 'text':
+        # A linter's output: syntax errors and diagnostics in line order.
+        found = [analysis.ErrorLocation(l, e) for l, e in zip(result.logicals, result.errors)
+                 if e is not None]
+        found.extend((line, col, '%s %s' % (code, message))
+                     for line, col, code, message in diagnostics)
+        found.sort(key=lambda d: d[:2])
+        out = b''.join(b'%s:%d:%d: %s\n' % ((path,) + d) for d in found)
+    elif options.errors_only and fmt == 'text':
         out = b''.join(b'%s:%d:%d: %s\n' % ((path,) + analysis.ErrorLocation(l, e))
                        for l, e in pairs)
     elif fmt == 'text':
@@ -183,11 +219,22 @@ def Report(result, options):
     elif fmt == 'jsonl':
         prefix = '"path": %s, "version": %s, ' % (JsonString(path), _Null(result.version))
         out = b''.join([JsonLine(l, e, prefix) + '\n' for l, e in pairs])
+        out += b''.join(['{%s%s}\n' % (prefix, _JsonDiagnostic(d)) for d in diagnostics])
     else:
-        out = '{"path": %s, "version": %s, "status": "%s", "problem": %s, "lines": [%s]}' % (
+        checked = ''
+        if options.check:
+            checked = ', "diagnostics": [%s]' % ', '.join(
+                ['{%s}' % _JsonDiagnostic(d) for d in diagnostics])
+        out = '{"path": %s, "version": %s, "status": "%s", "problem": %s%s, "lines": [%s]}' % (
             JsonString(path), _Null(result.version), result.status, _Null(result.problem),
-            ','.join(['\n  ' + JsonLine(l, e) for l, e in pairs]))
-    return out, problem, len(result.logicals), errors, result.status
+            checked, ','.join(['\n  ' + JsonLine(l, e) for l, e in pairs]))
+    return out, problem, len(result.logicals), errors, result.status, len(diagnostics)
+
+
+def _JsonDiagnostic(diagnostic):
+    line, col, code, message = diagnostic
+    return '"line": %d, "column": %d, "code": "%s", "message": %s' % (
+        line, col, code, JsonString(message))
 
 
 def ReportTask(task, options):
@@ -286,6 +333,14 @@ def _Tasks(args, stdin):
     return tasks
 
 
+def _Codes(text):
+    codes = [c.strip().upper() for c in text.split(',') if c.strip()]
+    for code in codes:
+        if not re.match(r'[A-Z][0-9]*\Z', code):
+            raise argparse.ArgumentTypeError('not a diagnostic code: %r' % code)
+    return codes
+
+
 def _ParseArgs(argv):
     parser = argparse.ArgumentParser(
         prog='treelens', description=__doc__.split('\n\n')[0],
@@ -310,6 +365,14 @@ def _ParseArgs(argv):
                         help='analyse files in N processes (output is the same)')
     parser.add_argument('-q', '--quiet', action='store_true',
                         help='no progress bar and no closing summary')
+    parser.add_argument('--check', action='store_true',
+                        help='report undefined names (F821), unused imports (F401), '
+                        'redefinitions of unused names (F811), unused locals (F841) and star '
+                        'imports (F403, F405) as path:line:col: CODE message')
+    parser.add_argument('--select', type=_Codes, metavar='CODES',
+                        help='with --check, only these codes (comma-separated prefixes)')
+    parser.add_argument('--ignore', type=_Codes, metavar='CODES',
+                        help='with --check, not these codes (comma-separated prefixes)')
     # Paths may follow options too (treelens a.py --format json b.py).
     args, extra = parser.parse_known_args(argv)
     unknown = [a for a in extra if a.startswith('-') and a != '-']
@@ -337,7 +400,8 @@ def Main(argv=None, stdin=None, stdout=None, stderr=None):
 
 def _Run(args, stdin, out, err):
     started = time.time()
-    options = Options(args.lang, args.format, args.errors_only, args.checks)
+    options = Options(args.lang, args.format, args.errors_only, args.checks, args.check,
+                      args.select, args.ignore)
     tasks = _Tasks(args, stdin)
     progress = Progress(len(tasks), _Silent() if args.quiet else err)
     pool = None
@@ -347,11 +411,11 @@ def _Run(args, stdin, out, err):
         reports = pool.imap(_WorkerReport, tasks, 1)
     else:
         reports = (ReportTask(task, options) for task in tasks)
-    exit_status, lines, errors, files = kExitOk, 0, 0, 0
+    exit_status, lines, errors, files, found = kExitOk, 0, 0, 0, 0
     try:
         if args.format == 'json':
             out.write('{"files": [')
-        for i, (text, problem, count, error_count, status) in enumerate(reports):
+        for i, (text, problem, count, error_count, status, diagnostics) in enumerate(reports):
             if args.format == 'json':
                 out.write(('\n' if i == 0 else ',\n') + text)
             else:
@@ -359,7 +423,9 @@ def _Run(args, stdin, out, err):
             if problem is not None:
                 progress.Close()
                 err.write(problem)
-            exit_status = max(exit_status, kExitForStatus[status])
+            exit_status = max(exit_status, kExitForStatus[status],
+                              kExitSyntax if diagnostics else kExitOk)
+            found += diagnostics
             lines += count
             errors += error_count
             files += status in (analysis.kOk, analysis.kSyntaxError)
@@ -380,8 +446,9 @@ def _Run(args, stdin, out, err):
         pool.join()
     progress.Close()
     if not args.quiet:
-        err.write('%d files, %d logical lines, %d syntax errors, %.2f seconds\n'
-                  % (files, lines, errors, time.time() - started))
+        checked = ', %d diagnostics' % found if args.check else ''
+        err.write('%d files, %d logical lines, %d syntax errors%s, %.2f seconds\n'
+                  % (files, lines, errors, checked, time.time() - started))
     return exit_status
 
 

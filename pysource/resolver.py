@@ -1486,3 +1486,70 @@ def _ScopesOfLine(scope, reader):
         if k > 64:
             break
     return out
+
+
+# ---- Names of one line with their positions, for the line view
+
+_kLineKeywords = _kPy3Keywords
+
+
+def DefinedName(logical):
+    """The name a def or class record binds, or None."""
+    if logical.fKind not in (1, 2) or logical.fTokenCount < 2:
+        return None
+    at = 2 if logical.GetTokenString(0) == b'async' else 1
+    name = logical.GetTokenString(at) if at < logical.fTokenCount else b''
+    return name if _kName.match(name) else None
+
+
+def LineNames(logical, names, reads):
+    """(defines, defines_at, reads_at) of one analyzed record: the names it
+    defines with the def or class name first, and the (line, column) of each
+    defined and each read name (1-based; None when not found), from where the
+    token reading places them."""
+    defined = DefinedName(logical)
+    defines = ([defined] if defined is not None and defined not in names else []) + list(names)
+    if not defines and not reads:
+        return defines, [], []
+    module = Scope('module', 'top', 1, 1, None)
+    reader = _Reader(module, '3.8', _kLineKeywords, False)
+    record_scope = Scope('class' if logical.fKind == 1 else 'function', defined or b'?',
+                         logical.fFirstLine + 1, 1, module) if defined is not None else None
+    try:
+        reader.Record(logical, module, record_scope)
+    except (IndexError, KeyError):
+        pass
+    bound, read = {}, {}
+    for scope in _AllScopes(module):
+        for b in scope.bindings:
+            key = (b.line, b.col)
+            if key < bound.get(b.name, (1 << 30, 0)):
+                bound[b.name] = key
+        for r in scope.references:
+            key = (r.line, r.col)
+            if key < read.get(r.name, (1 << 30, 0)):
+                read[r.name] = key
+    line = reader.line or _Line(logical)
+    defines_at = [bound.get(n) or _FirstToken(line, n) for n in defines]
+    reads_at = [read.get(n) if b'.' not in n and n in read else _FirstToken(line, n)
+                for n in reads]
+    return defines, defines_at, reads_at
+
+
+def _AllScopes(scope):
+    out = [scope]
+    for child in scope.children:
+        out.extend(_AllScopes(child))
+    return out
+
+
+def _FirstToken(line, name):
+    """(line, column) of the first tokens that spell a (dotted) name, not after a dot."""
+    parts = name.split(b'.')
+    texts = line.texts
+    for i, t in enumerate(texts):
+        if t == parts[0] and (i == 0 or texts[i - 1] != '.') and \
+                all(texts[i + 2 * k - 1:i + 2 * k + 1] == ['.', p]
+                    for k, p in enumerate(parts[1:], 1)):
+            return line.pos[i]
+    return None
