@@ -386,6 +386,8 @@ class _Reader(object):
                         pass
                     else:
                         self.Expr(i + 1, min(close, b), scope, annotation)
+                        if self.py2 and ':' in texts[i + 1:close]:
+                            self.EmptySteps(i + 1, min(close, b), scope)
                 else:
                     self.Display(i, min(close, b), scope, annotation)
                 i = close + 1
@@ -407,6 +409,16 @@ class _Reader(object):
                 elif annotation:
                     self.StringAnnotation(t, i, scope)
             i += 1
+
+    def EmptySteps(self, a, b, scope):
+        """Python 2 reads None for the empty step of a slice (a[x:y:])."""
+        texts = self.line.texts
+        for s, e in self.Split(a, b, (',',)):
+            colon = self.FindAtDepth0(s, e, (':',))
+            if colon < e:
+                second = self.FindAtDepth0(colon + 1, e, (':',))
+                if second == e - 1:
+                    self.Use(scope, 'None', second)
 
     def Args(self, a, b, scope, annotation=False):
         """Call arguments in [a, b): keyword names are not read; a lone
@@ -533,10 +545,13 @@ class _Reader(object):
             eq = self.FindAtDepth0(s, e, ('=',))
             if eq < e:
                 self.Expr(eq + 1, e, outer)
+            while texts[s] == '(' and self.line.match.get(s) == s + 2:
+                s += 1          # a parenthesized name: (x)
             if texts[s] == '(':
-                # Python 2 tuple parameter: an implicit parameter unpacked.
+                # Python 2 tuple parameter: an implicit parameter unpacked into
+                # parameters.
                 inner.AddFlag('.%d' % (position,), DEF_PARAM)
-                self.Target(s, eq, inner, kParameter)
+                self.Target(s, eq, inner, kParameter, flag=DEF_PARAM)
                 continue
             if self.IsName(texts[s]):
                 self.Bind(inner, texts[s], s, kParameter, flag=DEF_PARAM)
@@ -545,7 +560,7 @@ class _Reader(object):
 
     # -- targets
 
-    def Target(self, a, b, scope, kind, order=None):
+    def Target(self, a, b, scope, kind, order=None, flag=DEF_LOCAL):
         """Names bound by the target list in [a, b); what subscripts and
         attributes read is read."""
         texts, match = self.line.texts, self.line.match
@@ -561,7 +576,7 @@ class _Reader(object):
                     self.Expr(i, end, scope)
                     i = end
                     continue
-                self.Target(i + 1, min(close, b), scope, kind, order)
+                self.Target(i + 1, min(close, b), scope, kind, order, flag)
                 i = close + 1
                 continue
             if t == '.':
@@ -581,6 +596,8 @@ class _Reader(object):
                                 self.Args(j + 1, min(close, b), scope)
                             else:
                                 self.Expr(j + 1, min(close, b), scope)
+                                if self.py2:
+                                    self.EmptySteps(j + 1, min(close, b), scope)
                             j = close + 1
                     i = j
                     continue
@@ -589,7 +606,7 @@ class _Reader(object):
                     r.deleting = True
                     bound.append(self.Bind(scope, t, i, kDel, order))
                 else:
-                    bound.append(self.Bind(scope, t, i, kind, order))
+                    bound.append(self.Bind(scope, t, i, kind, order, flag))
             i += 1
         return bound
 
@@ -840,6 +857,7 @@ class Module(object):
         self.noqa = {}
         self.future_annotations = False
         self._symbols_done = False
+        self._at = None
 
     # -- the tree
 
@@ -887,11 +905,15 @@ class Module(object):
 
     def NameAt(self, line, col):
         """The binding or reference whose name covers (line, col), 1-based, or None."""
-        for scope in self.Scopes():
-            for item in scope.references + scope.bindings:
-                if item.line == line and item.col <= col < item.col + len(item.name) and \
-                        not getattr(item, 'string', False):
-                    return item
+        if self._at is None:
+            at = self._at = {}
+            for scope in self.Scopes():
+                for item in scope.bindings + scope.references:
+                    if not (isinstance(item, Reference) and item.string):
+                        at.setdefault(item.line, []).append(item)
+        for item in self._at.get(line, ()):
+            if item.col <= col < item.col + len(item.name):
+                return item
         return None
 
     def DefinitionsAt(self, line, col):
