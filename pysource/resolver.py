@@ -205,7 +205,7 @@ class Binding(object):
     the qualified name ('os.path', 'a.b.c' for from a.b import c)."""
 
     __slots__ = ('name', 'kind', 'line', 'col', 'scope', 'order', 'references', 'qualified',
-                 'record', 'clauses', 'decorators')
+                 'record', 'clauses', 'decorators', 'aliased', 'statement')
 
     def __init__(self, name, kind, line, col, scope, order, record, clauses):
         self.name = name
@@ -219,6 +219,8 @@ class Binding(object):
         self.record = record
         self.clauses = clauses
         self.decorators = ()
+        self.aliased = False        # import ... as name
+        self.statement = None       # (line, col) of the import statement
 
     def __repr__(self):
         return '<Binding %s %s %d:%d>' % (self.kind, self.name, self.line, self.col)
@@ -233,7 +235,7 @@ class Reference(object):
     it was read from a string annotation or type comment."""
 
     __slots__ = ('name', 'line', 'col', 'scope', 'order', 'resolution', 'binding', 'early',
-                 'annotation', 'string', 'clauses', 'deleting')
+                 'annotation', 'string', 'clauses', 'deleting', 'exported')
 
     def __init__(self, name, line, col, scope, order, clauses):
         self.name = name
@@ -248,6 +250,7 @@ class Reference(object):
         self.string = False
         self.clauses = clauses
         self.deleting = False
+        self.exported = False       # an entry of __all__
 
     def __repr__(self):
         return '<Reference %s %d:%d %s>' % (self.name, self.line, self.col, self.resolution)
@@ -302,6 +305,7 @@ class _Reader(object):
         self.line = None
         self.in_string = False      # reading a string annotation: the compiler sees no names
         self.normalize = not self.py2   # Python 3 identifiers are NFKC-normalized
+        self.foreign = {}           # name -> bindings of module names made in functions
 
     # -- helpers
 
@@ -318,6 +322,11 @@ class _Reader(object):
         scope.bindings.append(b)
         if flag:
             scope.AddFlag(name, flag)
+        if scope.kind != 'module' and \
+                scope.flags.get(scope.Mangle(name) if name[:2] == '__' else name, 0) & DEF_GLOBAL:
+            # A module name bound (or declared) by a function: known to the
+            # reads that run after the module's top level.
+            self.foreign.setdefault(name, []).append(b)
         return b
 
     def Use(self, scope, name, i, annotation=False):
@@ -646,7 +655,7 @@ class _Reader(object):
                     at = self.FindAtDepth0(s, e, ('as',))
                     self.Expr(s, at, scope)
                     if at < e:
-                        self.Target(at + 1, e, scope, kWithTarget, order=colon)
+                        self.Target(at + 1, e, scope, kWithTarget, order=e)
             elif head == 'except':
                 at = self.FindAtDepth0(i + 1, colon, ('as',) if not self.py2 else ('as', ','))
                 self.Expr(i + 1, at, scope)
@@ -688,9 +697,11 @@ class _Reader(object):
                 if at < e:
                     bd = self.Bind(scope, texts[at + 1], at + 1, kImport, order=b,
                                    flag=DEF_IMPORT)
+                    bd.aliased = True
                 else:
                     bd = self.Bind(scope, texts[s], s, kImport, order=b, flag=DEF_IMPORT)
                 bd.qualified = dotted
+                bd.statement = self.line.pos[a]
             return
         if head == 'from':
             at = a + 1
@@ -706,6 +717,7 @@ class _Reader(object):
                 if texts[s2] == '*':
                     bd = self.Bind(scope, '*', s2, kStarImport, order=b, flag=0)
                     bd.qualified = module
+                    bd.statement = self.line.pos[a]
                     scope.star_imports.append(bd)
                     continue
                 if module == '__future__' and texts[s2] == 'annotations':
@@ -713,6 +725,8 @@ class _Reader(object):
                 kw = s2 + 2 if e2 - s2 >= 3 and texts[s2 + 1] == 'as' else s2
                 bd = self.Bind(scope, texts[kw], kw, kFromImport, order=b, flag=DEF_IMPORT)
                 bd.qualified = module + (b'' if module.endswith(b'.') else b'.') + texts[s2]
+                bd.aliased = kw != s2
+                bd.statement = self.line.pos[a]
             return
         if head in ('global', 'nonlocal'):
             kind = kGlobalDecl if head == 'global' else kNonlocalDecl
@@ -858,6 +872,9 @@ class Module(object):
         self.future_annotations = False
         self._symbols_done = False
         self._at = None
+        self._star_used = False
+        self.foreign = {}
+        self.statements = {}        # if/try statement id -> (head, line, handler names)
 
     # -- the tree
 
@@ -975,7 +992,7 @@ class Module(object):
                 self._ResolveOne(r, deferred_annotations)
         for name, (line, col) in self.all_names:
             r = Reference(name, line, col, self.module, (1 << 30, 0), ())
-            r.string = True
+            r.string = r.exported = True
             self._ResolveOne(r, True)
             self.module.references.append(r)
 
@@ -1028,6 +1045,13 @@ class Module(object):
                     r.binding.references.append(r)
                     return
             if scope.kind == 'module':
+                foreign = self.foreign.get(name)
+                if foreign and deferred:
+                    real = [b for b in foreign if b.kind != kGlobalDecl]
+                    r.binding = (real or foreign)[-1]
+                    r.resolution = kBound
+                    r.binding.references.append(r)
+                    return
                 break
             if first and scope.kind == 'class' and name in kClassNames:
                 r.resolution = kBuiltin
@@ -1043,6 +1067,7 @@ class Module(object):
             r.resolution = kBuiltin
         elif self.module.star_imports:
             r.resolution = kUnknown
+            self._star_used = True
         else:
             r.resolution = kUndefined
 
@@ -1070,17 +1095,25 @@ class Module(object):
         out = []
         for scope in self.Scopes():
             for r in scope.references:
-                if r.resolution == kUndefined or r.early:
-                    out.append((r.line, r.col, 'F821', "undefined name '%s'" % r.name))
+                if r.exported:
+                    if r.resolution == kUndefined:
+                        out.append((r.line, r.col, 'F822',
+                                    "undefined name '%s' in __all__" % r.name))
+                elif r.resolution == kUndefined or r.early:
+                    if not self._GuardedByNameError(r):
+                        out.append((r.line, r.col, 'F821', "undefined name '%s'" % r.name))
                 elif r.resolution == kUnknown:
                     modules = ', '.join(b.qualified for b in self.module.star_imports)
                     out.append((r.line, r.col, 'F405',
                                 "'%s' may be undefined, or defined from star imports: %s"
                                 % (r.name, modules)))
             for b in scope.star_imports:
-                out.append((b.line, b.col, 'F403',
+                line, col = b.statement
+                out.append((line, col, 'F403',
                             "'from %s import *' used; unable to detect undefined names"
                             % b.qualified))
+                if not self._star_used and not self.stub and scope.kind != 'class':
+                    out.append((line, col, 'F401', "'%s.*' imported but unused" % b.qualified))
             out.extend(self._ScopeDiagnostics(scope))
         out = [d for d in out if _Selected(d[2], select, ignore) and not self._Silenced(d)]
         out.sort()
@@ -1115,16 +1148,15 @@ class Module(object):
             last = current
             if last is None:
                 continue
+            # Imports in a class body are its members.
             if last.kind in _kImportKinds and not used_any and name not in exported and \
                     not self.stub and not (last.qualified or '').startswith('__future__.') and \
-                    not self.module.star_imports == ['all']:
+                    scope.kind != 'class':
                 shown = last.qualified or name
-                if last.kind == kImport and last.qualified and \
-                        last.qualified.split(b'.')[-1] != name and last.qualified != name:
+                if last.aliased:
                     shown = '%s as %s' % (last.qualified, name)
-                elif last.kind == kFromImport and last.qualified.rsplit(b'.', 1)[-1] != name:
-                    shown = '%s as %s' % (last.qualified, name)
-                out.append((last.line, last.col, 'F401', "'%s' imported but unused" % shown))
+                line, col = last.statement or (last.line, last.col)
+                out.append((line, col, 'F401', "'%s' imported but unused" % shown))
             if scope.kind == 'function' and last.kind in (kAssignment, kAnnotated) and \
                     not used_any and name != '_' and name not in declared and \
                     not scope.uses_locals and name != '__tracebackhide__':
@@ -1136,6 +1168,21 @@ class Module(object):
                     out.append((b.line, b.col, 'F841',
                                 "local variable '%s' is assigned to but never used" % name))
         return out
+
+    def _GuardedByNameError(self, r):
+        """Whether a read is in the body of a try statement (of its own function)
+        that handles NameError."""
+        owner = r.scope
+        while owner.kind not in ('module', 'function', 'lambda'):
+            owner = owner.parent
+        for sid, group in reversed(r.clauses):
+            statement = self.statements.get(sid)
+            if statement is None or statement[0] != 'try':
+                continue
+            if group != 0 or statement[1] < owner.line:
+                return False
+            return 'NameError' in statement[2]
+        return False
 
     def _Silenced(self, diagnostic):
         codes = self.noqa.get(diagnostic[0], False)
@@ -1258,10 +1305,11 @@ def _AnalyzeBlock(scope, bound, global_, py2):
 class _Clauses(object):
     """The if/try clauses enclosing each line, from the indentation of the records."""
 
-    def __init__(self):
+    def __init__(self, statements):
         self.stack = []          # (indent, statement id, clause group)
-        self.last_at = {}        # indent -> (statement id, head, group) of the last header
+        self.last_at = {}        # indent -> (statement id, head, clauses) of the last header
         self.next_id = 0
+        self.statements = statements    # statement id -> (head, line, handler names)
 
     def Enter(self, logical, texts):
         indent = logical.fIndent
@@ -1274,15 +1322,23 @@ class _Clauses(object):
             head = texts[1]
         if head in _kCompoundHeads:
             if head in _kClauseHeads and indent in self.last_at:
-                sid, first, group = self.last_at[indent]
-                if first == 'try' and head == 'else':
-                    g = 0
-                else:
-                    g = group + 1
+                sid, first, count = self.last_at[indent]
+                count += 1
+                # A try statement's else runs with its body.
+                g = 0 if first == 'try' and head == 'else' else count
+                if head == 'except' and first == 'try':
+                    names = self.statements[sid][2]
+                    for i in range(1, logical.fTokenCount):
+                        t = logical.GetTokenString(i)
+                        if t in (b':', b'as'):
+                            break
+                        names.add(t)
             else:
-                sid, first, g = self.next_id, head, 0
+                sid, first, count, g = self.next_id, head, 0, 0
                 self.next_id += 1
-            self.last_at[indent] = (sid, first, g)
+                if head == 'try':
+                    self.statements[sid] = ('try', logical.fFirstLine + 1, set())
+            self.last_at[indent] = (sid, first, count)
             self.stack.append((indent, sid, g))
         else:
             self.last_at.pop(indent, None)
@@ -1311,7 +1367,7 @@ def Resolve(result, stub=None):
         keywords = _kPy3Keywords
     reader = _Reader(module.module, version, keywords, stub)
     scopes = {}
-    clauses = _Clauses()
+    clauses = _Clauses(module.statements)
     decorated = None
     errors = result.errors or [None] * len(result.logicals)
     last_line = 1
@@ -1320,15 +1376,16 @@ def Resolve(result, stub=None):
         last = logical.fFirstLine + logical.fLineText.count(b'\n') + \
             (0 if logical.fLineText.endswith(b'\n') else 1)
         last_line = max(last_line, last)
-        if kind in (21, 22):
-            for text, (row, col) in logical.fTokens:
-                if text[:1] == '#':
-                    _Comment(module, reader, text, logical.fFirstLine + row + 1)
-            continue
         parent = logical.fParentScope
         scope = scopes.get(id(parent)) if parent is not None else module.module
         if scope is None:
             scope = module.module
+        if kind in (21, 22):
+            reader.record_index = index
+            for text, (row, col) in logical.fTokens:
+                if text[:1] == '#':
+                    _Comment(module, reader, text, logical.fFirstLine + row + 1, col + 1, scope)
+            continue
         s = scope
         while s is not None:
             if last > s.end_line:
@@ -1364,11 +1421,13 @@ def Resolve(result, stub=None):
                 record_scope.binding.decorators = tuple(decorated[1])
         for text, (row, col) in logical.fTokens:
             if text[:1] == '#':
-                _Comment(module, reader, text, logical.fFirstLine + row + 1)
+                _Comment(module, reader, text, logical.fFirstLine + row + 1, col + 1,
+                         scope if error is None else None)
         if first_text != '@':
             decorated = None
     module.module.end_line = last_line
     module.all_names = reader.all_names
+    module.foreign = reader.foreign
     module.future_annotations = reader.future_annotations
     module._Resolve()
     return module
@@ -1465,12 +1524,32 @@ def _FStringField(text, i, end, out):
     return i + 1
 
 
-def _Comment(module, reader, text, line):
+def _Comment(module, reader, text, line, col, scope):
+    """A comment: `# noqa` silences its line, a type comment reads names."""
     m = _kNoqa.search(text)
     if m:
         codes = m.group('codes')
         module.noqa[line] = None if codes is None else \
             [c.upper() for c in _kCodes.findall(codes)]
+    if scope is not None and b'type:' in text:
+        m = _kTypeComment.match(text)
+        if m:
+            body = m.group(1).split(b'#')[0].strip()
+            if body and not body.startswith(b'ignore'):
+                saved = reader.line
+                reader.line = _Position(line, col)
+                try:
+                    reader.ParsedNames(body, 0, scope)
+                finally:
+                    reader.line = saved
+
+
+class _Position(object):
+    """Stands for a line whose only token is at (line, col)."""
+
+    def __init__(self, line, col):
+        self.pos = [(line, col)]
+        self.n = 1
 
 
 def _AddRecordedReads(reader, logical, scope):
