@@ -30,6 +30,7 @@ counts only once it has happened (in line order); names read in a function
 body from enclosing scopes see every binding there, since the body runs later.
 """
 
+import os
 import re
 
 from pysource import utils
@@ -390,6 +391,10 @@ class _Reader(object):
                                                 or prev[-1:] in '\'"')
                 if t == '(' and trailer:
                     self.Args(i + 1, min(close, b), scope, annotation)
+                    if prev == 'cast' and i + 1 < close and texts[i + 1][-1:] in '\'"' and \
+                            (texts[i - 2] != '.' or texts[i - 3] == 'typing'):
+                        # typing.cast's type may be a string
+                        self.StringAnnotation(texts[i + 1], i + 1, scope)
                 elif t == '[' and trailer:
                     if annotation and prev == 'Literal':
                         pass
@@ -697,7 +702,7 @@ class _Reader(object):
                 if at < e:
                     bd = self.Bind(scope, texts[at + 1], at + 1, kImport, order=b,
                                    flag=DEF_IMPORT)
-                    bd.aliased = True
+                    bd.aliased = texts[at - 1] != texts[at + 1]
                 else:
                     bd = self.Bind(scope, texts[s], s, kImport, order=b, flag=DEF_IMPORT)
                 bd.qualified = dotted
@@ -725,7 +730,7 @@ class _Reader(object):
                 kw = s2 + 2 if e2 - s2 >= 3 and texts[s2 + 1] == 'as' else s2
                 bd = self.Bind(scope, texts[kw], kw, kFromImport, order=b, flag=DEF_IMPORT)
                 bd.qualified = module + (b'' if module.endswith(b'.') else b'.') + texts[s2]
-                bd.aliased = kw != s2
+                bd.aliased = texts[kw] != texts[s2]
                 bd.statement = self.line.pos[a]
             return
         if head in ('global', 'nonlocal'):
@@ -752,6 +757,8 @@ class _Reader(object):
         op = texts[eq]
         if op in _kAugOps:
             self.Expr(eq + 1, b, scope)
+            if head == '__all__' and op == '+=' and scope.kind == 'module':
+                self.AllNames(eq + 1, b)
             if eq == a + 1 and self.IsName(head):
                 self.Use(scope, head, a)
                 self.Bind(scope, head, a, kAugmented, order=b)
@@ -1020,6 +1027,11 @@ class Module(object):
             if candidates:
                 live = [b for b in candidates if b.kind != kDel] or candidates
                 if deferred or scope.kind in ('lambda', 'comprehension'):
+                    if deferred and candidates[-1].kind == kDel and not candidates[-1].clauses \
+                            and scope.kind == 'module':
+                        # Deleted at the top level: gone once the module has run.
+                        r.resolution = kUndefined
+                        return
                     before = [b for b in live if b.order < r.order]
                     r.binding = before[-1] if before else live[-1]
                 else:
@@ -1087,16 +1099,19 @@ class Module(object):
 
     # -- diagnostics
 
-    def Diagnostics(self, select=None, ignore=None):
+    def Diagnostics(self, select=None, ignore=None, noqa=True):
         """[(line, col, code, message)] sorted, 1-based: F821 undefined name, F401
         unused import, F811 redefinition of an unused name, F841 unused local,
         F403 star import, F405 name maybe from a star import. select and ignore
-        are code prefixes; a line's `# noqa` (or `# noqa: CODE,...`) silences it."""
+        are code prefixes; a line's `# noqa` (or `# noqa: CODE,...`) silences it
+        unless noqa is False."""
         out = []
         for scope in self.Scopes():
             for r in scope.references:
                 if r.exported:
-                    if r.resolution == kUndefined:
+                    # Packages' __init__ often list submodules.
+                    if r.resolution == kUndefined and not (self.path and os.path.basename(
+                            self.path) == '__init__.py'):
                         out.append((r.line, r.col, 'F822',
                                     "undefined name '%s' in __all__" % r.name))
                 elif r.resolution == kUndefined or r.early:
@@ -1115,7 +1130,8 @@ class Module(object):
                 if not self._star_used and not self.stub and scope.kind != 'class':
                     out.append((line, col, 'F401', "'%s.*' imported but unused" % b.qualified))
             out.extend(self._ScopeDiagnostics(scope))
-        out = [d for d in out if _Selected(d[2], select, ignore) and not self._Silenced(d)]
+        out = [d for d in out if _Selected(d[2], select, ignore) and
+               not (noqa and self._Silenced(d))]
         out.sort()
         return out
 
@@ -1150,6 +1166,7 @@ class Module(object):
                 continue
             # Imports in a class body are its members.
             if last.kind in _kImportKinds and not used_any and name not in exported and \
+                    name not in declared and \
                     not self.stub and not (last.qualified or '').startswith('__future__.') and \
                     scope.kind != 'class':
                 shown = last.qualified or name
