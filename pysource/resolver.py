@@ -128,6 +128,9 @@ _kAugOps = frozenset(['+=', '-=', '*=', '/=', '//=', '%=', '**=', '>>=', '<<=', 
                       '|=', '@='])
 _kOpen = {'(': ')', '[': ']', '{': '}'}
 _kClose = frozenset([')', ']', '}'])
+_kBrackets = frozenset(['(', ')', '[', ']', '{', '}'])
+_kNonAscii = re.compile(br'[\x80-\xff]')
+_kFString = re.compile(br'(?<![A-Za-z0-9_])[rR]?[fF][rR]?[\'"]')
 _kCompoundHeads = frozenset(['if', 'elif', 'while', 'for', 'with', 'try', 'except', 'else',
                              'finally', 'def', 'class'])
 _kClauseHeads = frozenset(['elif', 'else', 'except', 'finally'])
@@ -263,31 +266,31 @@ class Reference(object):
 class _Line(object):
     """The significant tokens of one record: texts, 1-based positions, bracket matches."""
 
-    __slots__ = ('texts', 'pos', 'match', 'n', 'comments')
+    __slots__ = ('texts', 'pos', 'match', 'n', 'comments', 'ascii')
 
     def __init__(self, logical):
         first = logical.fFirstLine + 1
-        texts, pos, comments = [], [], []
-        for text, (row, col) in logical.fTokens:
-            c = text[:1]
-            if c == '#':
-                comments.append((first + row, text))
-                continue
-            if c == '\\' and text == '\\':
-                continue
-            texts.append(text)
-            pos.append((first + row, col + 1))
-        self.texts, self.pos, self.comments, self.n = texts, pos, comments, len(texts)
-        match = {}
-        stack = []
-        for i, t in enumerate(texts):
-            if t in _kOpen:
-                stack.append(i)
-            elif t in _kClose and stack:
-                match[stack.pop()] = i
-        for i in stack:
-            match[i] = len(texts)
-        self.match = match
+        tokens = logical.fTokens
+        line_text = logical.fLineText
+        self.comments = ()
+        if '#' in line_text or '\\' in line_text:
+            # Comments and line continuations are tokens too.
+            self.comments = [(first + r, c + 1, t) for t, (r, c) in tokens if t[:1] == '#']
+            tokens = [tok for tok in tokens if tok[0][:1] != '#' and tok[0] != '\\']
+        self.texts = texts = [t for t, _ in tokens]
+        self.pos = [(first + r, c + 1) for _, (r, c) in tokens]
+        self.n = len(texts)
+        self.ascii = _kNonAscii.search(line_text) is None
+        match = self.match = {}
+        if '(' in line_text or '[' in line_text or '{' in line_text:
+            stack = []
+            for i in [i for i, t in enumerate(texts) if t in _kBrackets]:
+                if texts[i] in _kOpen:
+                    stack.append(i)
+                elif stack:
+                    match[stack.pop()] = i
+            for i in stack:
+                match[i] = len(texts)
 
 
 class _Reader(object):
@@ -314,7 +317,7 @@ class _Reader(object):
         return _kName.match(t) is not None and t not in self.keywords
 
     def Bind(self, scope, name, i, kind, order=None, flag=DEF_LOCAL):
-        if self.normalize and max(name) >= '\x80':
+        if self.normalize and not self.line.ascii and max(name) >= '\x80':
             name = _Normalize(name)
         line, col = self.line.pos[i] if i < self.line.n else self.line.pos[-1]
         b = Binding(name, kind, line, col, scope,
@@ -331,7 +334,7 @@ class _Reader(object):
         return b
 
     def Use(self, scope, name, i, annotation=False):
-        if self.normalize and max(name) >= '\x80':
+        if self.normalize and not self.line.ascii and max(name) >= '\x80':
             name = _Normalize(name)
         line, col = self.line.pos[i]
         r = Reference(name, line, col, scope, (self.record_index, i), self.clauses)
@@ -1436,10 +1439,14 @@ def Resolve(result, stub=None):
             _AddRecordedReads(reader, logical, scope)
             if record_scope is not None and record_scope.binding is not None and decorated:
                 record_scope.binding.decorators = tuple(decorated[1])
-        for text, (row, col) in logical.fTokens:
-            if text[:1] == '#':
-                _Comment(module, reader, text, logical.fFirstLine + row + 1, col + 1,
-                         scope if error is None else None)
+        if error is None:
+            if reader.line is not None:
+                for line, col, text in reader.line.comments:
+                    _Comment(module, reader, text, line, col, scope)
+        elif b'#' in logical.fLineText:
+            for text, (row, col) in logical.fTokens:
+                if text[:1] == '#':
+                    _Comment(module, reader, text, logical.fFirstLine + row + 1, col + 1, None)
         if first_text != '@':
             decorated = None
     module.module.end_line = last_line
@@ -1567,14 +1574,14 @@ class _Position(object):
     def __init__(self, line, col):
         self.pos = [(line, col)]
         self.n = 1
+        self.ascii = False
 
 
 def _AddRecordedReads(reader, logical, scope):
     """Reads the analyzer recorded that the token reading did not see: names in
     f-strings, placed at the string that holds them."""
     line = reader.line
-    if line is None or not any(t[:1] in 'fFrRbBuU' and t[-1:] in '\'"' and 'f' in
-                               t[:3].lower() for t in line.texts):
+    if line is None or not _kFString.search(logical.fLineText):
         return
     info = logical.GetDerivedInfo()
     if not info:
