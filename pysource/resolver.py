@@ -1169,7 +1169,7 @@ class Module(object):
                 continue
             # Imports in a class body are its members.
             if last.kind in _kImportKinds and not used_any and name not in exported and \
-                    name not in declared and \
+                    name not in declared and not self._SubmoduleOfUsed(scope, last) and \
                     not self.stub and not (last.qualified or '').startswith('__future__.') and \
                     scope.kind != 'class':
                 shown = last.qualified or name
@@ -1188,6 +1188,15 @@ class Module(object):
                     out.append((b.line, b.col, 'F841',
                                 "local variable '%s' is assigned to but never used" % name))
         return out
+
+    def _SubmoduleOfUsed(self, scope, binding):
+        """Whether `import a.b` loads a submodule of a package that the scope
+        imports under another name and uses (import a as x; x.b)."""
+        if binding.kind != kImport or binding.aliased or b'.' not in (binding.qualified or ''):
+            return False
+        package = binding.qualified.split(b'.')[0]
+        return any(b.kind == kImport and b.qualified == package and b.references
+                   for b in scope.bindings)
 
     def _GuardedByNameError(self, r):
         """Whether a read is in the body of a try statement (of its own function)
