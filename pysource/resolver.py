@@ -126,6 +126,7 @@ kBound, kBuiltin, kUnknown, kUndefined = 'binding', 'builtin', 'unknown', 'undef
 _kName = re.compile(br'[A-Za-z_\x80-\xff][A-Za-z0-9_\x80-\xff]*\Z')
 _kAugOps = frozenset(['+=', '-=', '*=', '/=', '//=', '%=', '**=', '>>=', '<<=', '&=', '^=',
                       '|=', '@='])
+_kAssignOps = frozenset(['=', ':']) | _kAugOps
 _kOpen = {'(': ')', '[': ']', '{': '}'}
 _kClose = frozenset([')', ']', '}'])
 _kBrackets = frozenset(['(', ')', '[', ']', '{', '}'])
@@ -266,7 +267,7 @@ class Reference(object):
 class _Line(object):
     """The significant tokens of one record: texts, 1-based positions, bracket matches."""
 
-    __slots__ = ('texts', 'pos', 'match', 'n', 'comments', 'ascii')
+    __slots__ = ('texts', 'pos', 'match', 'n', 'comments', 'ascii', 'kinds')
 
     def __init__(self, logical):
         first = logical.fFirstLine + 1
@@ -278,7 +279,8 @@ class _Line(object):
             self.comments = [(first + r, c + 1, t) for t, (r, c) in tokens if t[:1] == '#']
             tokens = [tok for tok in tokens if tok[0][:1] != '#' and tok[0] != '\\']
         self.texts = texts = [t for t, _ in tokens]
-        self.pos = [(first + r, c + 1) for _, (r, c) in tokens]
+        self.kinds = frozenset(texts)   # to skip searches for what a line lacks
+        self.pos = _Positions(tokens, first)
         self.n = len(texts)
         self.ascii = _kNonAscii.search(line_text) is None
         match = self.match = {}
@@ -291,6 +293,32 @@ class _Line(object):
                     match[stack.pop()] = i
             for i in stack:
                 match[i] = len(texts)
+
+
+class _Positions(object):
+    """The (line, column) of each token, 1-based, worked out when asked."""
+
+    __slots__ = ('tokens', 'first')
+
+    def __init__(self, tokens, first):
+        self.tokens = tokens
+        self.first = first
+
+    def __getitem__(self, i):
+        row, col = self.tokens[i][1]
+        return self.first + row, col + 1
+
+
+class _NameTest(dict):
+    """Token text -> whether it is a name (not a keyword), remembered."""
+
+    def __init__(self, keywords):
+        dict.__init__(self)
+        self.keywords = keywords
+
+    def __missing__(self, t):
+        found = self[t] = _kName.match(t) is not None and t not in self.keywords
+        return found
 
 
 class _Reader(object):
@@ -310,11 +338,9 @@ class _Reader(object):
         self.in_string = False      # reading a string annotation: the compiler sees no names
         self.normalize = not self.py2   # Python 3 identifiers are NFKC-normalized
         self.foreign = {}           # name -> bindings of module names made in functions
+        self.IsName = _NameTest(keywords).__getitem__
 
     # -- helpers
-
-    def IsName(self, t):
-        return _kName.match(t) is not None and t not in self.keywords
 
     def Bind(self, scope, name, i, kind, order=None, flag=DEF_LOCAL):
         if self.normalize and not self.line.ascii and max(name) >= '\x80':
@@ -352,7 +378,10 @@ class _Reader(object):
     def FindAtDepth0(self, a, b, wanted):
         """Index of the first token in wanted at bracket depth 0 in [a, b), lambdas
         skipped, or b."""
-        texts, match = self.line.texts, self.line.match
+        line = self.line
+        if line.kinds.isdisjoint(wanted):
+            return b
+        texts, match = line.texts, line.match
         lambdas = 0
         i = a
         while i < b:
@@ -753,7 +782,7 @@ class _Reader(object):
                                                   'await', 'yield'):
             self.Expr(a + 1, b, scope)
             return
-        eq = self.FindAtDepth0(a, b, ('=', ':') + tuple(_kAugOps))
+        eq = self.FindAtDepth0(a, b, _kAssignOps)
         if eq == b:
             self.Expr(a, b, scope)
             return
@@ -1340,15 +1369,16 @@ class _Clauses(object):
         self.next_id = 0
         self.statements = statements    # statement id -> (head, line, handler names)
 
-    def Enter(self, logical, texts):
+    def Enter(self, logical, head):
         indent = logical.fIndent
-        while self.stack and self.stack[-1][0] >= indent:
-            self.stack.pop()
-        for k in [k for k in self.last_at if k > indent]:
-            del self.last_at[k]
-        head = texts[0] if texts else None
-        if head == 'async' and len(texts) > 1:
-            head = texts[1]
+        stack = self.stack
+        if stack and stack[-1][0] >= indent:
+            while stack and stack[-1][0] >= indent:
+                stack.pop()
+            for k in [k for k in self.last_at if k > indent]:
+                del self.last_at[k]
+        if head == 'async' and logical.fTokenCount > 1:
+            head = logical.GetTokenString(1)
         if head in _kCompoundHeads:
             if head in _kClauseHeads and indent in self.last_at:
                 sid, first, count = self.last_at[indent]
@@ -1415,11 +1445,8 @@ def Resolve(result, stub=None):
                 if text[:1] == '#':
                     _Comment(module, reader, text, logical.fFirstLine + row + 1, col + 1, scope)
             continue
-        s = scope
-        while s is not None:
-            if last > s.end_line:
-                s.end_line = last
-            s = s.parent
+        if last > scope.end_line:
+            scope.end_line = last       # the enclosing scopes' ends follow below
         first_text = logical.GetTokenString(0) if logical.fTokenCount else b''
         reader.record_index = index
         record_scope = None
@@ -1438,8 +1465,7 @@ def Resolve(result, stub=None):
                                          for i in range(1, logical.fTokenCount)
                                          if logical.GetTokenString(i)[:1] != '#')
                                 .split(b'(')[0])
-        texts_head = [logical.GetTokenString(i) for i in range(min(2, logical.fTokenCount))]
-        reader.clauses = clauses.Enter(logical, texts_head)
+        reader.clauses = clauses.Enter(logical, first_text)
         if error is None:
             try:
                 reader.Record(logical, scope, record_scope)
@@ -1459,6 +1485,9 @@ def Resolve(result, stub=None):
         if first_text != '@':
             decorated = None
     module.module.end_line = last_line
+    for scope in reversed(module.Scopes()):
+        if scope.parent is not None and scope.end_line > scope.parent.end_line:
+            scope.parent.end_line = scope.end_line
     module.all_names = reader.all_names
     module.foreign = reader.foreign
     module.future_annotations = reader.future_annotations
@@ -1584,6 +1613,7 @@ class _Position(object):
         self.pos = [(line, col)]
         self.n = 1
         self.ascii = False
+        self.kinds = frozenset()
 
 
 def _AddRecordedReads(reader, logical, scope):
