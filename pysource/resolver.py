@@ -30,6 +30,7 @@ counts only once it has happened (in line order); names read in a function
 body from enclosing scopes see every binding there, since the body runs later.
 """
 
+import operator
 import os
 import re
 
@@ -129,6 +130,7 @@ _kAugOps = frozenset(['+=', '-=', '*=', '/=', '//=', '%=', '**=', '>>=', '<<=', 
 _kAssignOps = frozenset(['=', ':']) | _kAugOps
 _kOpen = {'(': ')', '[': ']', '{': '}'}
 _kClose = frozenset([')', ']', '}'])
+_kFirst = operator.itemgetter(0)
 _kBrackets = frozenset(['(', ')', '[', ']', '{', '}'])
 _kNonAscii = re.compile(br'[\x80-\xff]')
 _kFString = re.compile(br'(?<![A-Za-z0-9_])[rR]?[fF][rR]?[\'"]')
@@ -278,7 +280,7 @@ class _Line(object):
             # Comments and line continuations are tokens too.
             self.comments = [(first + r, c + 1, t) for t, (r, c) in tokens if t[:1] == '#']
             tokens = [tok for tok in tokens if tok[0][:1] != '#' and tok[0] != '\\']
-        self.texts = texts = [t for t, _ in tokens]
+        self.texts = texts = map(_kFirst, tokens)
         self.kinds = frozenset(texts)   # to skip searches for what a line lacks
         self.pos = _Positions(tokens, first)
         self.n = len(texts)
@@ -1368,6 +1370,7 @@ class _Clauses(object):
         self.last_at = {}        # indent -> (statement id, head, clauses) of the last header
         self.next_id = 0
         self.statements = statements    # statement id -> (head, line, handler names)
+        self.current = ()               # the clauses of the stack
 
     def Enter(self, logical, head):
         indent = logical.fIndent
@@ -1377,6 +1380,7 @@ class _Clauses(object):
                 stack.pop()
             for k in [k for k in self.last_at if k > indent]:
                 del self.last_at[k]
+            self.current = None
         if head == 'async' and logical.fTokenCount > 1:
             head = logical.GetTokenString(1)
         if head in _kCompoundHeads:
@@ -1399,11 +1403,14 @@ class _Clauses(object):
                     self.statements[sid] = ('try', logical.fFirstLine + 1, set())
             self.last_at[indent] = (sid, first, count)
             self.stack.append((indent, sid, g))
-        else:
-            self.last_at.pop(indent, None)
+            self.current = None
+        elif indent in self.last_at:
+            del self.last_at[indent]
         # A header's own names (an except clause's target, a body on the same
         # line) are inside its clause.
-        return tuple((s, g) for _, s, g in self.stack)
+        if self.current is None:
+            self.current = tuple((s, g) for _, s, g in self.stack)
+        return self.current
 
 
 def Resolve(result, stub=None):
@@ -1620,7 +1627,9 @@ def _AddRecordedReads(reader, logical, scope):
     """Reads the analyzer recorded that the token reading did not see: names in
     f-strings, placed at the string that holds them."""
     line = reader.line
-    if line is None or not _kFString.search(logical.fLineText):
+    text = logical.fLineText
+    if line is None or not ("f'" in text or 'f"' in text or "F'" in text or 'F"' in text) or \
+            not _kFString.search(text):
         return
     info = logical.GetDerivedInfo()
     if not info:
