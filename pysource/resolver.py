@@ -6,7 +6,7 @@
     module = resolver.Resolve(result)
     module.Outline()                 # [('def', 'f', 2, 3, [])]
     module.DefinitionsAt(3, 12)      # [<Binding import os 1:8>]
-    module.Diagnostics()             # [(3, 23, 'F821', "undefined name 'y'")]
+    module.Diagnostics()             # [(3, 21, 'F821', "undefined name 'y'")]
 
 Resolve reads the records of a FileAnalysis: their kind, their enclosing
 def or class record (fParentScope) and their tokens with positions. Each
