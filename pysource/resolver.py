@@ -413,7 +413,7 @@ class _Reader(object):
 
     def Expr(self, a, b, scope, annotation=False):
         """Reads the names of an expression in [a, b) as loads in scope."""
-        texts, match, line = self.line.texts, self.line.match, self.line
+        texts, match = self.line.texts, self.line.match
         i = a
         while i < b:
             t = texts[i]
@@ -460,7 +460,6 @@ class _Reader(object):
 
     def EmptySteps(self, a, b, scope):
         """Python 2 reads None for the empty step of a slice (a[x:y:])."""
-        texts = self.line.texts
         for s, e in self.Split(a, b, (',',)):
             colon = self.FindAtDepth0(s, e, (':',))
             if colon < e:
@@ -821,13 +820,22 @@ class _Reader(object):
         parts = self.Split(a, b, ('=',))
         value = parts[-1]
         self.Expr(value[0], value[1], scope)
+        # a, b = 1, 2 assigns each name as plainly as a = 1 does.
+        literal = all(self.IsDisplay(s, e) for s, e in parts)
         for s, e in parts[:-1]:
             if e == s + 1 and self.IsName(texts[s]):
                 self.Bind(scope, texts[s], s, kAssignment, order=b)
                 if texts[s] == '__all__' and scope.kind == 'module':
                     self.AllNames(value[0], value[1])
             else:
-                self.Target(s, e, scope, kUnpacking, order=b)
+                self.Target(s, e, scope, kAssignment if literal else kUnpacking, order=b)
+
+    def IsDisplay(self, s, e):
+        """Whether [s, e) is a tuple or list display (a, b / (a, b) / [a])."""
+        if self.FindAtDepth0(s, e, (',',)) < e:
+            return True
+        return e > s and self.line.texts[s] in ('(', '[') and self.line.match.get(s) == e - 1 \
+            and (self.line.texts[s] == '[' or self.FindAtDepth0(s + 1, e - 1, (',',)) < e - 1)
 
     def AllNames(self, a, b):
         """The string entries of an __all__ list or tuple in [a, b)."""
