@@ -1110,7 +1110,9 @@ class Module(object):
             if first and scope.kind == 'class' and name in kClassNames:
                 r.resolution = kBuiltin
                 return
-            if first and name == '__class__' and scope.kind == 'function' and _InClass(scope):
+            if name == '__class__' and scope.kind == 'function' and self.version != '2.7' and \
+                    _InClass(scope):
+                # The implicit cell of the class a function is defined in.
                 r.resolution = kBuiltin
                 return
             if scope.kind in ('function', 'lambda'):
