@@ -30,6 +30,7 @@ counts only once it has happened (in line order); names read in a function
 body from enclosing scopes see every binding there, since the body runs later.
 """
 
+import bisect
 import operator
 import os
 import re
@@ -131,6 +132,7 @@ _kAssignOps = frozenset(['=', ':']) | _kAugOps
 _kOpen = {'(': ')', '[': ']', '{': '}'}
 _kClose = frozenset([')', ']', '}'])
 _kFirst = operator.itemgetter(0)
+_kOrder = operator.attrgetter('order')
 _kBrackets = frozenset(['(', ')', '[', ']', '{', '}'])
 _kNonAscii = re.compile(br'[\x80-\xff]')
 _kFString = re.compile(br'(?<![A-Za-z0-9_])[rR]?[fF][rR]?[\'"]')
@@ -152,7 +154,7 @@ class Scope(object):
 
     __slots__ = ('kind', 'name', 'line', 'col', 'end_line', 'decorated_line', 'parent',
                  'children', 'bindings', 'references', 'flags', 'scopes', 'binding',
-                 'star_imports', 'uses_locals', 'in_string', '_by_name')
+                 'star_imports', 'uses_locals', 'in_string', '_by_name', '_candidates')
 
     def __init__(self, kind, name, line, col, parent):
         self.kind = kind
@@ -170,6 +172,7 @@ class Scope(object):
         self.uses_locals = False
         self.in_string = False      # opened in an f-string's replacement field
         self._by_name = None
+        self._candidates = None
         if parent is not None:
             parent.children.append(self)
 
@@ -193,6 +196,21 @@ class Scope(object):
 
     def IsFunctionLike(self):
         return self.kind in ('function', 'lambda', 'comprehension')
+
+    def Candidates(self, name):
+        """(bindings, their orders, those that are not a del, their orders) of a
+        name, in flow order, declarations left out."""
+        if self._candidates is None:
+            self._candidates = {}
+        found = self._candidates.get(name)
+        if found is None:
+            bindings = sorted((b for b in self.BindingsNamed(name)
+                               if b.kind not in (kGlobalDecl, kNonlocalDecl, kStarImport)),
+                              key=_kOrder)
+            live = [b for b in bindings if b.kind != kDel] or bindings
+            found = self._candidates[name] = (bindings, [b.order for b in bindings], live,
+                                              [b.order for b in live])
+        return found
 
     def BindingsNamed(self, name):
         if self._by_name is None:
@@ -1064,27 +1082,38 @@ class Module(object):
                     scope = scope.parent
                 first, deferred = False, True
                 continue
-            candidates = [b for b in scope.BindingsNamed(name)
-                          if b.kind not in (kGlobalDecl, kNonlocalDecl, kStarImport)]
+            candidates, orders, live, live_orders = scope.Candidates(name)
             if candidates:
-                live = [b for b in candidates if b.kind != kDel] or candidates
                 if deferred or scope.kind in ('lambda', 'comprehension'):
                     if deferred and candidates[-1].kind == kDel and not candidates[-1].clauses \
                             and scope.kind == 'module':
                         # Deleted at the top level: gone once the module has run.
                         r.resolution = kUndefined
                         return
-                    before = [b for b in live if b.order < r.order]
-                    r.binding = before[-1] if before else live[-1]
+                    at = bisect.bisect_left(live_orders, r.order)
+                    r.binding = live[at - 1] if at else live[-1]
                 else:
-                    before = [b for b in candidates
-                              if b.order < r.order and b.kind != kAnnotationOnly]
-                    if before and before[-1].kind == kDel and not _Conditional(before[-1], r):
+                    # The latest binding that has happened: a del unbinds unless it
+                    # is in a block the read is not in.
+                    found = None
+                    j = bisect.bisect_left(orders, r.order) - 1
+                    while j >= 0:
+                        b = candidates[j]
+                        j -= 1
+                        if b.kind == kAnnotationOnly:
+                            continue
+                        if b.kind == kDel:
+                            if found is None and not _Conditional(b, r):
+                                found = False
+                                break
+                            continue
+                        found = b
+                        break
+                    if found is False:
                         r.resolution = kUndefined
                         return
-                    before = [b for b in before if b.kind != kDel]
-                    if before:
-                        r.binding = before[-1]
+                    if found is not None:
+                        r.binding = found
                     elif scope.kind == 'function':
                         # Read before any binding in its own function: the local it
                         # will be, reported only when nothing outside has the name.
