@@ -194,9 +194,6 @@ class Scope(object):
         owner = scope.name.lstrip('_')
         return '_%s%s' % (owner, name) if owner else name
 
-    def IsFunctionLike(self):
-        return self.kind in ('function', 'lambda', 'comprehension')
-
     def Candidates(self, name):
         """(bindings, their orders, those that are not a del, their orders) of a
         name, in flow order, declarations left out."""
@@ -1689,21 +1686,20 @@ def _AddRecordedReads(reader, logical, scope):
 
 
 def _ScopesOfLine(scope, reader):
+    """The statement's scope and the scopes opened on the line being read."""
+    first = reader.line.pos[0][0] if reader.line.n else 0
     out = [scope]
     k = 0
     while k < len(out):
-        out.extend(c for c in out[k].children
-                   if c.kind in ('lambda', 'comprehension', 'function', 'class'))
+        for child in reversed(out[k].children):
+            if child.line < first:
+                break
+            out.append(child)
         k += 1
-        if k > 64:
-            break
     return out
 
 
 # ---- Names of one line with their positions, for the line view
-
-_kLineKeywords = _kPy3Keywords
-
 
 def DefinedName(logical):
     """The name a def or class record binds, or None."""
@@ -1717,51 +1713,60 @@ def DefinedName(logical):
 def LineNames(logical, names, reads):
     """(defines, defines_at, reads_at) of one analyzed record: the names it
     defines with the def or class name first, and the (line, column) of each
-    defined and each read name (1-based; None when not found), from where the
-    token reading places them."""
+    defined and each read name (1-based; None when not found).
+
+    One pass over the tokens: a defined name is at its first occurrence that
+    does not follow a dot, a read name (dotted or not) at its first such
+    occurrence that no defined name took, or at the f-string that holds it.
+    """
     defined = DefinedName(logical)
     defines = ([defined] if defined is not None and defined not in names else []) + list(names)
     if not defines and not reads:
         return defines, [], []
-    module = Scope('module', 'top', 1, 1, None)
-    reader = _Reader(module, '3.8', _kLineKeywords, False)
-    record_scope = Scope('class' if logical.fKind == 1 else 'function', defined or b'?',
-                         logical.fFirstLine + 1, 1, module) if defined is not None else None
-    try:
-        reader.Record(logical, module, record_scope)
-    except (IndexError, KeyError):
-        pass
-    bound, read = {}, {}
-    for scope in _AllScopes(module):
-        for b in scope.bindings:
-            key = (b.line, b.col)
-            if key < bound.get(b.name, (1 << 30, 0)):
-                bound[b.name] = key
-        for r in scope.references:
-            key = (r.line, r.col)
-            if key < read.get(r.name, (1 << 30, 0)):
-                read[r.name] = key
-    line = reader.line or _Line(logical)
-    defines_at = [bound.get(n) or _FirstToken(line, n) for n in defines]
-    reads_at = [read.get(n) if b'.' not in n and n in read else _FirstToken(line, n)
-                for n in reads]
+    tokens = logical.fTokens
+    first = logical.fFirstLine + 1
+    texts = map(_kFirst, tokens)
+    where = {}
+    for name in set(defines) | set(n.split(b'.', 1)[0] for n in reads):
+        at, i = [], -1
+        while True:
+            try:
+                i = texts.index(name, i + 1)
+            except ValueError:
+                break
+            if i == 0 or texts[i - 1] != '.':
+                at.append(i)
+        where[name] = at
+    taken = set()
+    defines_at = []
+    for name in defines:
+        at = where.get(name)
+        if at:
+            taken.add(at[0])
+            row, col = tokens[at[0]][1]
+            defines_at.append((first + row, col + 1))
+        else:
+            defines_at.append(None)
+    reads_at = []
+    for name in reads:
+        parts = name.split(b'.')
+        found = None
+        for i in where.get(parts[0], ()):
+            if all(i + 2 * k < len(texts) and texts[i + 2 * k - 1] == '.' and
+                   texts[i + 2 * k] == part for k, part in enumerate(parts[1:], 1)):
+                if i not in taken:
+                    found = i
+                    break
+                if found is None:
+                    found = i
+        if found is None:
+            for i, text in enumerate(texts):
+                if text[-1:] in '\'"' and parts[0] in text:
+                    found = i
+                    break
+        if found is None:
+            reads_at.append(None)
+        else:
+            row, col = tokens[found][1]
+            reads_at.append((first + row, col + 1))
     return defines, defines_at, reads_at
-
-
-def _AllScopes(scope):
-    out = [scope]
-    for child in scope.children:
-        out.extend(_AllScopes(child))
-    return out
-
-
-def _FirstToken(line, name):
-    """(line, column) of the first tokens that spell a (dotted) name, not after a dot."""
-    parts = name.split(b'.')
-    texts = line.texts
-    for i, t in enumerate(texts):
-        if t == parts[0] and (i == 0 or texts[i - 1] != '.') and \
-                all(texts[i + 2 * k - 1:i + 2 * k + 1] == ['.', p]
-                    for k, p in enumerate(parts[1:], 1)):
-            return line.pos[i]
-    return None
