@@ -12,9 +12,10 @@ Resolve reads the records of a FileAnalysis: their kind, their enclosing
 def or class record (fParentScope) and their tokens with positions. Each
 line's tokens are read once more here to place every name: which scope it
 belongs to (lambdas and comprehensions open scopes inside a line), whether it
-is bound, read or deleted, and at which column. Names the token reading does
-not see but the analyzer recorded (those inside f-strings) are added from
-the record's reads. Lines with a syntax error contribute nothing.
+is bound, read or deleted, and at which column (f-string fields, string
+annotations and type comments included). A read the analyzer recorded that
+the token reading did not place is added at the string that holds it. Lines
+with a syntax error contribute nothing.
 
 The scope rules are Python's: class bodies are not visible from their
 methods, comprehensions have their own scope (Python 2's list
@@ -254,7 +255,8 @@ class Reference(object):
     early when a module or class level read comes before any binding of its
     name there, annotation when it is in an annotation (deferred with
     `from __future__ import annotations`, in stubs and in strings), string when
-    it was read from a string annotation or type comment."""
+    it was read from a string annotation or type comment, deleting when it is
+    the target of a del, exported when it is an entry of __all__."""
 
     __slots__ = ('name', 'line', 'col', 'scope', 'order', 'resolution', 'binding', 'early',
                  'annotation', 'string', 'clauses', 'deleting', 'exported')
