@@ -542,6 +542,11 @@ kPeerDisagreements = [
 
 
 class PeerCorpusTest(unittest.TestCase):
+    """Undefined names and unused imports beside pyflakes3's, on the files both
+    read: of the 2061 files of /usr/lib/python3.11 and dist-packages, the 2059
+    that pyflakes parses and the analyzer (3.8 at most) reads without a syntax
+    error. In full: 1016 reports of theirs, 1024 of ours, 1016 shared.
+    """
 
     def testUndefinedNamesAndUnusedImportsAgreeWithPyflakes(self):
         if not os.path.exists('/usr/bin/pyflakes3'):
