@@ -576,8 +576,11 @@ class PeerCorpusTest(unittest.TestCase):
                 theirs.add((m.group(1), int(m.group(2)), code, m.group(3) or m.group(4)))
         both = ours & theirs
         self.assertGreater(len(compared), len(files) // 2)
-        self.assertGreaterEqual(len(both), 0.99 * len(theirs), sorted(theirs - ours)[:20])
-        self.assertGreaterEqual(len(both), 0.99 * len(ours), sorted(ours - theirs)[:20])
+        if not os.environ.get('TREELENS_CORPUS_LIMIT') and not support.kSanitized:
+            # The share is judged on the whole corpus; a sample holds too few
+            # reports for it, and is judged by the classes below alone.
+            self.assertGreaterEqual(len(both), 0.99 * len(theirs), sorted(theirs - ours)[:20])
+            self.assertGreaterEqual(len(both), 0.99 * len(ours), sorted(ours - theirs)[:20])
         unexplained = [d for d in (ours ^ theirs)
                        if not any(rule(d[2], d[3]) for _, rule in kPeerDisagreements)]
         self.assertEqual(unexplained, [])
