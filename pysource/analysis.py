@@ -800,7 +800,9 @@ def LineView(logical, error=None):
 
     A dict: line (first line, 1-based), kind ('stmt', 'class', 'def', 'try',
     'comment', 'blank'), text (the whole physical lines, line ends included),
-    defines (names defined), reads (names read), equivs ((name, info) type
+    defines (names defined, a def or class line's name first), reads (names
+    read), defines_at and reads_at (the (line, column) of each, 1-based, or
+    None), equivs ((name, info) type
     equivalences other than reads), args (argument names), arg_equivs ((name,
     info) pairs of the arguments), bases (base-class texts), error (None, or
     a dict of message, line, column and byte_column, 1-based; column counts
@@ -810,12 +812,18 @@ def LineView(logical, error=None):
     info = logical.GetDerivedInfo() or kNoDerivedInfo
     names, type_equivs, args, arg_equivs, bases = info
     reads, equivs = SplitReads(type_equivs)
+    defines, defines_at, reads_at = list(names), [None] * len(names), [None] * len(reads)
+    if error is None:
+        from pysource import resolver
+        defines, defines_at, reads_at = resolver.LineNames(logical, names, reads)
     view = {
         'line': logical.fFirstLine + 1,
         'kind': KindName(logical.fKind),
         'text': logical.fLineText,
-        'defines': list(names),
+        'defines': defines,
+        'defines_at': defines_at,
         'reads': reads,
+        'reads_at': reads_at,
         'equivs': equivs,
         'args': list(args),
         'arg_equivs': list(arg_equivs),

@@ -24,13 +24,21 @@ Texts are the source bytes decoded as UTF-8; a byte that is not valid UTF-8
 appears as the lone surrogate U+DC80 + byte, so that in Python 3
 text.encode('utf-8', 'surrogateescape') gives back the exact bytes.
 
+--check reports what the resolver finds across lines, as
+path:line:col: CODE message: F821 undefined name, F401 unused import, F811
+redefinition of an unused name, F841 unused local variable, F403 star import,
+F405 name that may come from a star import (--select and --ignore take codes;
+a line's "# noqa" or "# noqa: F401" silences it); syntax errors are listed
+among them. With json each file has "diagnostics"; with jsonl each is an
+object with path, line, column, code and message.
+
 --errors-only prints only the syntax errors, as path:line:col: message (the
 column counts characters from 1); with json or jsonl, only the lines with one
 and the records of files that were not analyzed. In the text formats a path's
 backslashes and control characters are escaped (\\\\, \\n, \\t, \\xNN).
 
 Exit status: 0 when every file was analyzed and no line has a syntax error,
-1 when some line has one, 2 for a usage error, a path that cannot be read, a
+1 when some line has one (or --check found something), 2 for a usage error, a path that cannot be read, a
 file whose analysis failed (the other paths are still analyzed) or output
 that cannot be written, 130 when interrupted. Problems go to standard error.
 """
@@ -48,6 +56,7 @@ import sys
 import time
 
 from pysource import analysis
+from pysource import resolver
 
 kFormats = ('text', 'json', 'jsonl')
 kExitOk, kExitSyntax, kExitProblem = 0, 1, 2
@@ -103,8 +112,9 @@ def _JsonPairs(pairs):
     return '[' + ', '.join(['[%s, %s]' % (JsonString(n), JsonString(i)) for n, i in pairs]) + ']'
 
 
-kJsonNothingRecorded = (', "defines": [], "reads": [], "equivs": [], "args": [], '
-                        '"arg_equivs": [], "bases": [], "error": null, "truncated": false}')
+kJsonNothingRecorded = (', "defines": [], "defines_at": [], "reads": [], "reads_at": [], '
+                        '"equivs": [], "args": [], "arg_equivs": [], "bases": [], "error": null, '
+                        '"truncated": false}')
 
 
 def JsonLine(logical, error, prefix=''):
@@ -115,20 +125,26 @@ def JsonLine(logical, error, prefix=''):
         JsonString(logical.fLineText))
     info = logical.GetDerivedInfo()
     truncated = logical.fTruncated
-    if info is None and error is None and not truncated:
+    if info is None and error is None and not truncated and logical.fKind not in (1, 2):
         return head + kJsonNothingRecorded
     names, type_equivs, args, arg_equivs, bases = info or analysis.kNoDerivedInfo
     reads, equivs = analysis.SplitReads(type_equivs)
     if error is None:
         error_json = 'null'
+        names, defines_at, reads_at = resolver.LineNames(logical, names, reads)
     else:
         error_json = ('{"message": %s, "line": %d, "column": %d, "byte_column": %d}'
                       % _ErrorFields(logical, error))
-    return '%s, "defines": %s, "reads": %s, "equivs": %s, "args": %s, "arg_equivs": %s, ' \
-        '"bases": %s, "error": %s, "truncated": %s}' % (
-            head, _JsonStrings(names), _JsonStrings(reads), _JsonPairs(equivs),
-            _JsonStrings(args), _JsonPairs(arg_equivs), _JsonStrings(bases), error_json,
-            'true' if truncated else 'false')
+        defines_at, reads_at = [None] * len(names), [None] * len(reads)
+    return '%s, "defines": %s, "defines_at": %s, "reads": %s, "reads_at": %s, "equivs": %s, ' \
+        '"args": %s, "arg_equivs": %s, "bases": %s, "error": %s, "truncated": %s}' % (
+            head, _JsonStrings(names), _JsonPositions(defines_at), _JsonStrings(reads),
+            _JsonPositions(reads_at), _JsonPairs(equivs), _JsonStrings(args),
+            _JsonPairs(arg_equivs), _JsonStrings(bases), error_json, 'true' if truncated else 'false')
+
+
+def _JsonPositions(positions):
+    return '[' + ', '.join(['null' if p is None else '[%d, %d]' % p for p in positions]) + ']'
 
 
 def _ErrorFields(logical, error):
@@ -174,10 +190,13 @@ kTruncatedNote = ('%s:%d: note: the walk stopped at its limits (10000 visits, ne
 def TextBlock(path, logical, error):
     """The text block of one analyzed record, or b'' when it records nothing."""
     info = logical.GetDerivedInfo()
-    if info is None and error is None and not logical.fTruncated:
+    if info is None and error is None and not logical.fTruncated and logical.fKind not in (1, 2):
         return b''
     names, type_equivs, args, arg_equivs, bases = info or analysis.kNoDerivedInfo
     reads, equivs = analysis.SplitReads(type_equivs)
+    defined = resolver.DefinedName(logical) if error is None else None
+    if defined is not None and defined not in names:
+        names = (defined,) + tuple(names)
     fields = [(b'defines', b', '.join(names)), (b'reads', b', '.join(reads)),
               (b'equivs', _Pairs(equivs)), (b'args', b', '.join(args)),
               (b'arg equivs', _Pairs(arg_equivs)), (b'bases', b', '.join(bases))]
@@ -195,11 +214,15 @@ def TextBlock(path, logical, error):
 class Options(object):
     """What the output of a file depends on."""
 
-    def __init__(self, version, fmt, errors_only, checks=True):
+    def __init__(self, version, fmt, errors_only, checks=True, check=False, select=None,
+                 ignore=None):
         self.version = version
         self.fmt = fmt
         self.errors_only = errors_only
         self.checks = checks
+        self.check = check          # --check: the resolver's diagnostics
+        self.select = select
+        self.ignore = ignore
 
 
 def _PathBytes(path):
@@ -210,7 +233,8 @@ kAnalyzed = (analysis.kOk, analysis.kSyntaxError)
 
 
 def Report(result, options):
-    """(output bytes, problem line or None, logical lines, syntax errors, status) of a FileAnalysis."""
+    """(output bytes, problem line or None, logical lines, syntax errors, status,
+    diagnostics) of a FileAnalysis."""
     path = _PathBytes(result.path)
     line_path = EscapePath(path)
     problem = None
@@ -226,7 +250,18 @@ def Report(result, options):
         pairs = [(l, e) for l, e in pairs if e is not None]
     errors = sum(1 for e in result.errors if e is not None)
     fmt = options.fmt
-    if options.errors_only and fmt == 'text':
+    diagnostics = []
+    if options.check and result.status in kAnalyzed:
+        diagnostics = resolver.Resolve(result).Diagnostics(options.select, options.ignore)
+    if options.check and fmt == 'text':
+        # A linter's output: syntax errors and diagnostics in line order.
+        found = [analysis.ErrorPosition(l, e)[:2] + analysis.ErrorPosition(l, e)[3:]
+                 for l, e in zip(result.logicals, result.errors) if e is not None]
+        found.extend((line, col, '%s %s' % (code, message))
+                     for line, col, code, message in diagnostics)
+        found.sort(key=lambda d: d[:2])
+        out = b''.join(b'%s:%d:%d: %s\n' % ((line_path,) + d) for d in found)
+    elif options.errors_only and fmt == 'text':
         out = b''.join(b'%s:%s\n' % (line_path, _ErrorText(l, e)) for l, e in pairs)
     elif fmt == 'text':
         head = b'%s: version %s\n' % (line_path, result.version) if result.status in kAnalyzed else b''
@@ -239,11 +274,22 @@ def Report(result, options):
         if not result.logicals and not (options.errors_only and result.status in kAnalyzed):
             out = '{%s"status": "%s", "problem": %s}\n' % (prefix, result.status,
                                                            _Null(result.problem))
+        out += b''.join(['{%s%s}\n' % (prefix, _JsonDiagnostic(d)) for d in diagnostics])
     else:
-        out = '{"path": %s, "version": %s, "status": "%s", "problem": %s, "lines": [%s]}' % (
+        checked = ''
+        if options.check:
+            checked = ', "diagnostics": [%s]' % ', '.join(
+                ['{%s}' % _JsonDiagnostic(d) for d in diagnostics])
+        out = '{"path": %s, "version": %s, "status": "%s", "problem": %s%s, "lines": [%s]}' % (
             JsonString(path), _Null(result.version), result.status, _Null(result.problem),
-            ','.join(['\n  ' + JsonLine(l, e) for l, e in pairs]))
-    return out, problem, len(result.logicals), errors, result.status
+            checked, ','.join(['\n  ' + JsonLine(l, e) for l, e in pairs]))
+    return out, problem, len(result.logicals), errors, result.status, len(diagnostics)
+
+
+def _JsonDiagnostic(diagnostic):
+    line, col, code, message = diagnostic
+    return '"line": %d, "column": %d, "code": "%s", "message": %s' % (
+        line, col, code, JsonString(message))
 
 
 def ReportTask(task, options):
@@ -488,6 +534,14 @@ def _Tasks(args, stdin):
     return tasks
 
 
+def _Codes(text):
+    codes = [c.strip().upper() for c in text.split(',') if c.strip()]
+    for code in codes:
+        if not re.match(r'[A-Z][0-9]*\Z', code):
+            raise argparse.ArgumentTypeError('not a diagnostic code: %r' % code)
+    return codes
+
+
 def _ParseArgs(argv):
     parser = argparse.ArgumentParser(
         prog='treelens', description=__doc__.split('\n\n')[0],
@@ -518,6 +572,14 @@ def _ParseArgs(argv):
                         'file and %d)' % kMaxJobs)
     parser.add_argument('-q', '--quiet', action='store_true',
                         help='no progress bar and no closing summary')
+    parser.add_argument('--check', action='store_true',
+                        help='report undefined names (F821), unused imports (F401), '
+                        'redefinitions of unused names (F811), unused locals (F841) and star '
+                        'imports (F403, F405) as path:line:col: CODE message')
+    parser.add_argument('--select', type=_Codes, metavar='CODES',
+                        help='with --check, only these codes (comma-separated prefixes)')
+    parser.add_argument('--ignore', type=_Codes, metavar='CODES',
+                        help='with --check, not these codes (comma-separated prefixes)')
     # Paths may follow options too (treelens a.py --format json b.py).
     args, extra = parser.parse_known_args(argv)
     unknown = [a for a in extra if a.startswith('-') and a != '-']
@@ -600,7 +662,8 @@ def _Run(args, stdin, out, err):
     pool = None
     out = _Output(out)
     try:
-        options = Options(args.lang, args.format, args.errors_only, args.checks)
+        options = Options(args.lang, args.format, args.errors_only, args.checks, args.check,
+                          args.select, args.ignore)
         tasks = _Tasks(args, stdin)
         progress = Progress(len(tasks), _Silent() if args.quiet else err)
         jobs = min(args.jobs, len(tasks), kMaxJobs)
@@ -609,10 +672,10 @@ def _Run(args, stdin, out, err):
             reports = pool.Reports(tasks)
         else:
             reports = (ReportTask(task, options) for task in tasks)
-        exit_status, lines, errors, files = kExitOk, 0, 0, 0
+        exit_status, lines, errors, files, found = kExitOk, 0, 0, 0, 0
         if args.format == 'json':
             out.write('{"files": [')
-        for i, (text, problem, count, error_count, status) in enumerate(reports):
+        for i, (text, problem, count, error_count, status, diagnostics) in enumerate(reports):
             if args.format == 'json':
                 out.write(('\n' if i == 0 else ',\n') + text)
             else:
@@ -620,7 +683,9 @@ def _Run(args, stdin, out, err):
             if problem is not None:
                 progress.Close()
                 err.write(problem)
-            exit_status = max(exit_status, kExitForStatus[status])
+            exit_status = max(exit_status, kExitForStatus[status],
+                              kExitSyntax if diagnostics else kExitOk)
+            found += diagnostics
             lines += count
             errors += error_count
             files += status in kAnalyzed
@@ -632,8 +697,9 @@ def _Run(args, stdin, out, err):
             pool.Close()
         progress.Close()
         if not args.quiet:
-            err.write('%d files, %d logical lines, %d syntax errors, %.2f seconds\n'
-                      % (files, lines, errors, time.time() - started))
+            checked = ', %d diagnostics' % found if args.check else ''
+            err.write('%d files, %d logical lines, %d syntax errors%s, %.2f seconds\n'
+                      % (files, lines, errors, checked, time.time() - started))
     except KeyboardInterrupt:
         _Exit(pool, kExitInterrupted, err, 'interrupted')
     except _OutputError as e:

@@ -128,8 +128,9 @@ class CliTest(unittest.TestCase):
         line = [f for f in files if f['path'] == paths['latin1.py']][0]['lines'][1]
         self.assertEqual((line['defines'], line['reads'], line['equivs'], line['error']),
                          (['s'], [], [['s', u':l:string: \'caf\udce9\'']], None))
-        self.assertEqual(sorted(line), ['arg_equivs', 'args', 'bases', 'defines', 'equivs',
-                                        'error', 'kind', 'line', 'reads', 'text', 'truncated'])
+        self.assertEqual(sorted(line), ['arg_equivs', 'args', 'bases', 'defines', 'defines_at',
+                                        'equivs', 'error', 'kind', 'line', 'reads', 'reads_at',
+                                        'text', 'truncated'])
 
     def testSymlinkLoopAndMixedVersions(self):
         self.Write('pkg/old.py', b'print "x"\n')
