@@ -68,9 +68,19 @@ def CompletedSource(logical):
         return text + b'finally: pass\n'
     if first == b'@':
         return text + b'def function(): pass\n'
+    soft = first in (b'match', b'case') and len(toks) > 1 and toks[1] not in kNotSoftKeywordFollowers
+    if soft and first == b'case' and b':' in toks:
+        text = b'match 0:\n ' + text
     if last == b':':
+        if soft and first == b'match':
+            return text + b' case _: pass\n'
         text += b' pass\n'
     return text
+
+
+# Tokens after `match` or `case` that make the line an ordinary statement.
+kNotSoftKeywordFollowers = frozenset([b'=', b'.', b')', b']', b'}', b',', b';', b':', b':=', b'+=', b'-=', b'*=',
+                                      b'/=', b'%=', b'&=', b'|=', b'^=', b'<<=', b'>>=', b'**=', b'//=', b'@='])
 
 
 def LoadLogicals(limit):

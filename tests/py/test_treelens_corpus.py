@@ -68,6 +68,7 @@ def FileErrors(version, path, text):
             for l, e in zip(logicals, errors) if e is not None]
 
 
+kTypeParamPrefix = b':t:'
 kWord = re.compile(br'[A-Za-z_][A-Za-z_0-9]*')
 kQuoted = re.compile(br"'[^']*'")  # an encoded string literal in a rendered name
 kFString = re.compile(br"""[rR]?[fF][rR]?['"]""")
@@ -106,6 +107,9 @@ def Disagreements(rec, facts):
             out.append('within %s at %d' % (name, i))
     bound_within = set(n for n, _ in rec['within'])
     out.extend('no within %s' % n for n in utf8(facts['within']) if n not in bound_within)
+    # A type parameter is recorded as (name, ':t:' + its star prefix), not as a name the line binds.
+    params = set(n for n, i in rec['equivs'] if i.startswith(kTypeParamPrefix))
+    out.extend('type parameter %s' % n for n in utf8(facts.get('typeparams') or []) if n not in params)
     out.extend('global %s' % n for n in utf8(facts['globals']) if (n, si.kGlobalPrefix) not in rec['equivs'])
     out.extend('nonlocal %s' % n for n in utf8(facts['nonlocals'])
                if (n, si.kNonlocalPrefix) not in rec['equivs'])
@@ -141,9 +145,13 @@ class AstJudge(object):
                 self.wrong.extend('%s:%d: %r: %s' % (path, line, text, d) for d in Disagreements(rec, fact))
 
 
+def Triple(version):
+    return tuple(int(p) for p in version.split('.'))
+
+
 def FactsOf(version):
     """The function giving the ast facts of sources as the X.Y interpreter gives them."""
-    script = kFactsMain % (version >= '3.8')
+    script = kFactsMain % (Triple(version) >= (3, 8))
 
     def Facts(sources):
         data = json.dumps([[str(i), src.decode('latin-1')] for i, src in enumerate(sources)])
@@ -228,7 +236,7 @@ class Corpus3Test(unittest.TestCase):
             self.skipTest('no Python %s %s' % (version, what))
         analyzer = analysis.GetAnalyzer(version).ImplFor([])
         # 3.7 on, async and await are keywords everywhere: no scope rule to apply.
-        async_scopes = version < '3.7'
+        async_scopes = Triple(version) < (3, 7)
         texts = [(path, support.ReadBytes(path)) for path in files]
         compiling = OracleCompiles(version, texts)
         wrong, judged, suspects, counts = [], [], [], []
@@ -264,6 +272,24 @@ class Corpus3Test(unittest.TestCase):
 
     def testStubs38(self):
         self.Check('3.8', support.StubFiles(), 'typeshed stubs')
+
+    def testStdlib39(self):
+        self.Check('3.9', support.CorpusFiles('3.9'))
+
+    def testStdlib310(self):
+        self.Check('3.10', support.CorpusFiles('3.10'))
+
+    def testStdlib311(self):
+        self.Check('3.11', support.CorpusFiles('3.11'))
+
+    def testStdlib312(self):
+        self.Check('3.12', support.CorpusFiles('3.12'))
+
+    def testStdlib313(self):
+        self.Check('3.13', support.CorpusFiles('3.13'))
+
+    def testStubs313(self):
+        self.Check('3.13', support.StubFiles(), 'typeshed stubs')
 
 
 def ResidentBytes():
