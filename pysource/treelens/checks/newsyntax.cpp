@@ -211,6 +211,11 @@ private:
     N *Rest = nullptr;
     for (Py_ssize_t I = 1; I + 1 < count(X); I += 2) {
       N *Item = child(X, I);
+      if (Rest) {
+        // The rest comes last.
+        Report(true, Item, "invalid syntax");
+        return;
+      }
       if (count(Item) == 2 && textIs(child(Item, 0), "**")) {
         Rest = child(Item, 1);
         if (text(Rest) == "_")
