@@ -260,7 +260,7 @@ class ChecksTest(unittest.TestCase):
         self.assertEqual(after[1:], before[1:])
 
     def testMutatedStdlibLines(self):
-        for version in [v for v in ('2.7', '3.6', '3.7', '3.8') if v in analysis.kVersions]:
+        for version in [v for v in ('2.7', '3.6', '3.7', '3.8', '3.12', '3.13') if v in analysis.kVersions]:
             found = mutants.Compare(version, kMutants)
             if found is None:
                 continue
@@ -269,7 +269,10 @@ class ChecksTest(unittest.TestCase):
             self.assertEqual(judged.false_rejects, [], version)
             self.assertLessEqual(len(judged.false_accepts), judged.rejected // 1000,
                                  (version, judged.false_accepts))
-            self.assertGreaterEqual(judged.same_message, 0.95 * judged.rejected, version)
+            # From 3.9 on CPython's PEG parser words its errors its own way ("expected ':'",
+            # "Perhaps you forgot a comma?"); the grammar's errors here stay "invalid syntax".
+            if version in ('2.7', '3.6', '3.7', '3.8'):
+                self.assertGreaterEqual(judged.same_message, 0.95 * judged.rejected, version)
 
 
 if __name__ == '__main__':
