@@ -112,9 +112,10 @@ def Check(version, logicals, errors, text, path=None, checks=True):
     if checks:
         _FutureImports(version, logicals, statements, found)
         _Loops(version, logicals, statements, errors, found)
-        if _Triple(version) >= (3, 10):
+        # Two more passes over the statements only for a text that may need them.
+        if _Triple(version) >= (3, 10) and (text is None or b'case' in text and b'match' in text):
             _MatchCases(version, logicals, statements, errors, found)
-        if _Triple(version) >= (3, 11):
+        if _Triple(version) >= (3, 11) and (text is None or _kExceptStar.search(text)):
             _ExceptStars(logicals, statements, errors, found)
 
 
@@ -534,6 +535,7 @@ def _CheckLoop(version, logical, index, words, stack, found):
 # ---- match statements and except* (3.10, 3.11)
 
 _kKeywordWords = frozenset([b'None', b'True', b'False'])
+_kExceptStar = re.compile(br'except[ \t\f\\\r\n]*\*')
 
 
 def _MatchCases(version, logicals, statements, errors, found):
