@@ -91,6 +91,7 @@ def Disagreements(rec, facts):
     """Where the recorded info and CPython's ast facts of one line disagree."""
     utf8 = lambda names: [n.encode('utf-8') if not isinstance(n, bytes) else n for n in names]
     tokens, out = rec['tokens'], []
+    raw_reads = rec['reads']
     if any(ord(c) > 127 for c in b''.join(tokens)):  # CPython 3 binds identifiers NFKC-normalized
         rec = dict(rec, defined=set(NFKC(n) for n in rec['defined']), reads=set(NFKC(n) for n in rec['reads']))
     significant = [t for t in tokens if not t.startswith((b'#', b'\\'))]
@@ -99,7 +100,7 @@ def Disagreements(rec, facts):
     # A name read may be rendered with subscripts, calls and literals (`a[i].f`, `','.join`):
     # its words must be on the line.
     line = b' '.join(tokens)
-    out.extend('reads absent %s' % n for n in rec['reads'] if any(w not in line for w in kWord.findall(kQuoted.sub(b'', n))))
+    out.extend('reads absent %s' % n for n in raw_reads if any(w not in line for w in kWord.findall(kQuoted.sub(b'', n))))
     for name, info in rec['within']:
         i = int(info[len(si.kWithinExprPrefix):])
         last = name.split(b'.')[-1]  # inside an f-string: the f-string token that holds it
@@ -121,6 +122,9 @@ def Disagreements(rec, facts):
     return out
 
 
+kMaxJudgedTokens = 2500
+
+
 class AstJudge(object):
     """Checks analyzed logicals against the ast facts of their completed sources, in batches.
 
@@ -132,8 +136,10 @@ class AstJudge(object):
         self.facts_of, self.wrong, self.batch, self.pending = facts_of, wrong, batch, []
 
     def Add(self, path, logicals):
+        # The walker stops at its visit limit (10,000 nodes) and says so: what it recorded of
+        # a line that long (a generated table of thousands of tokens) is partial, not judged.
         self.pending.extend(((path, l.fFirstLine + 1, l.fLineText[:120], Recorded(l)), CompletedSource(l))
-                            for l in logicals)
+                            for l in logicals if l.fTokenCount <= kMaxJudgedTokens)
         if len(self.pending) >= self.batch:
             self.Flush()
 
@@ -143,6 +149,10 @@ class AstJudge(object):
         for ((path, line, text, rec), _), fact in zip(pending, facts):
             if fact is not None:
                 self.wrong.extend('%s:%d: %r: %s' % (path, line, text, d) for d in Disagreements(rec, fact))
+
+
+def HasFString(logical):
+    return any(kFString.match(t) for t, _ in logical.fTokens)
 
 
 def Triple(version):
@@ -241,23 +251,43 @@ class Corpus3Test(unittest.TestCase):
         compiling = OracleCompiles(version, texts)
         wrong, judged, suspects, counts = [], [], [], []
         judge = AstJudge(FactsOf(version), judged, batch=40000)  # one process per 40,000 lines
+        # 3.12's f-strings (a field reusing the string's quote, comments, line breaks) are
+        # lexed as 3.11 lexes them: lines with f-strings that 3.11's CPython rejects are
+        # set aside, not judged.
+        pep701 = Triple(version) >= (3, 12)
+        deferred = []  # (path, logical, result) of f-string lines
         for path, text in texts:
             analyzed = []
             for logical, result in Analyze(analyzer, text, async_scopes, counts, analyzed):
-                if path in compiling:
+                if pep701 and HasFString(logical):
+                    deferred.append((path, logical, result))
+                elif path in compiling:
                     wrong.append(Describe(path, logical, result))
                 else:
                     suspects.append((len(suspects), (path, logical, result)))
             if path in compiling:
                 wrong.extend(FileErrors(version, path, text))
+            if pep701:
+                deferred.extend((path, l, None) for l in analyzed if HasFString(l))
+                analyzed = [l for l in analyzed if not HasFString(l)]
             judge.Add(path, analyzed)
+        older = OracleCompiles('3.11', [(i, CompletedSource(l)) for i, (_, l, _) in enumerate(deferred)]) or set()
+        for i, (path, logical, result) in enumerate(deferred):
+            if i not in older:
+                continue
+            if result is None:
+                judge.Add(path, [logical])
+            elif path in compiling:
+                wrong.append(Describe(path, logical, result))
+            else:
+                suspects.append((len(suspects), (path, logical, result)))
         judge.Flush()
         accepted = OracleCompiles(version, [(i, CompletedSource(l)) for i, (_, l, _) in suspects])
         wrong.extend(Describe(*item) for i, item in suspects if i in accepted)
         sys.stderr.write('\n%s %s: %d files (%d rejected by CPython), %d logical lines, %d disagree, '
-                         '%d disagree with the ast\n'
+                         '%d disagree with the ast, %d lines with 3.12 f-strings set aside\n'
                          % (version, what, len(texts), len(texts) - len(compiling), sum(counts), len(wrong),
-                            len(judged)))
+                            len(judged), len(deferred) - len(older)))
         self.assertEqual(wrong[:40], [])
         self.assertEqual(judged[:40], [], '\n'.join(judged[:40]))
 
