@@ -113,7 +113,7 @@ def Check(version, logicals, errors, text, path=None, checks=True):
         _FutureImports(version, logicals, statements, found)
         _Loops(version, logicals, statements, errors, found)
         # Two more passes over the statements only for a text that may need them.
-        if _Triple(version) >= (3, 10) and (text is None or b'case' in text and b'match' in text):
+        if _Triple(version) >= (3, 10) and (text is None or _kCaseLine.search(text) and _kMatchLine.search(text)):
             _MatchCases(version, logicals, statements, errors, found)
         if _Triple(version) >= (3, 11) and (text is None or _kExceptStar.search(text)):
             _ExceptStars(logicals, statements, errors, found)
@@ -536,6 +536,8 @@ def _CheckLoop(version, logical, index, words, stack, found):
 
 _kKeywordWords = frozenset([b'None', b'True', b'False'])
 _kExceptStar = re.compile(br'except[ \t\f\\\r\n]*\*')
+_kCaseLine = re.compile(br'(?m)^[ \t\f]*case\b')
+_kMatchLine = re.compile(br'(?m)^[ \t\f]*match\b')
 
 
 def _MatchCases(version, logicals, statements, errors, found):
@@ -544,7 +546,7 @@ def _MatchCases(version, logicals, statements, errors, found):
     stack = []      # [match indent, case indent, (index, error) of an irrefutable case]
     for index in statements:
         logical = logicals[index]
-        indent = _IndentColumns(_FirstLine(logical))[0]
+        indent = logical.fIndent
         while stack and stack[-1][0] >= indent:
             stack.pop()
         first = logical.GetTokenString(0) if logical.fTokenCount else b''
@@ -573,7 +575,7 @@ def _ExceptStars(logicals, statements, errors, found):
     stack = []      # [indent of a try, b'*' or b'' once a clause says which]
     for index in statements:
         logical = logicals[index]
-        indent = _IndentColumns(_FirstLine(logical))[0]
+        indent = logical.fIndent
         words = None
         first = logical.GetTokenString(0) if logical.fTokenCount else b''
         while stack and (stack[-1][0] > indent or (stack[-1][0] == indent and first not in (

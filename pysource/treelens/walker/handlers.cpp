@@ -728,7 +728,7 @@ void visitSingleDecorator(NW *W, PyObject *Node) {
   NodeObject *N = asNodeOf(Node, C::CSingleDecorator);
   Ref Dotted = decoratorGetDottedName(N);
   visitNode(W, Dotted.get());
-  if (rawCount(N) == 3 && !isNodeOf(Dotted.get(), C::CNameLiteral)) {
+  if (rawCount(N) == 3 && !isNodeOf(Dotted.get(), C::CNameLiteral) && !isNodeOf(Dotted.get(), C::CDottedName)) {
     // '@' namedexpr_test NEWLINE (3.9): a dotted name is called with the
     // function; a call has recorded itself; other expressions only read.
     Ref Name = text(W, Dotted.get(), dottedOnly());
