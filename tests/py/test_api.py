@@ -238,8 +238,8 @@ class FolderTest(unittest.TestCase):
                for r in analysis.AnalyzeFolder(self.tmp)]
         self.assertEqual(got, [('a/gone.py', None, analysis.kUnreadable),
                                ('a/loop', None, analysis.kSkipped),
-                               ('a/y.py', '3.8', analysis.kOk),
-                               ('a/z.pyi', '3.8', analysis.kOk),
+                               ('a/y.py', '3.13', analysis.kOk),
+                               ('a/z.pyi', '3.13', analysis.kOk),
                                ('b.py', '2.7', analysis.kOk)])
         self.assertEqual(analysis.WorstStatus(s for _, _, s in got), analysis.kUnreadable)
         result = analysis.AnalyzeFile(os.path.join(self.tmp, 'a', 'gone.py'))
