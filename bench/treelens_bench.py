@@ -68,9 +68,19 @@ def CompletedSource(logical):
         return text + b'finally: pass\n'
     if first == b'@':
         return text + b'def function(): pass\n'
+    soft = first in (b'match', b'case') and len(toks) > 1 and toks[1] not in kNotSoftKeywordFollowers
+    if soft and first == b'case' and b':' in toks:
+        text = b'match 0:\n ' + text
     if last == b':':
+        if soft and first == b'match':
+            return text + b' case _: pass\n'
         text += b' pass\n'
     return text
+
+
+# Tokens after `match` or `case` that make the line an ordinary statement.
+kNotSoftKeywordFollowers = frozenset([b'=', b'.', b')', b']', b'}', b',', b';', b':', b':=', b'+=', b'-=', b'*=',
+                                      b'/=', b'%=', b'&=', b'|=', b'^=', b'<<=', b'>>=', b'**=', b'//=', b'@='])
 
 
 def LoadLogicals(limit):
@@ -102,7 +112,7 @@ def TimeTreelens(analyzer, logicals, repeat, in_async=None, results=None):
 def TimeVersion(version, logicals, repeat):
     """Best seconds of the version's analyzer over the logicals, and how many it rejects."""
     from pysource import analysis
-    flags = [version < '3.7' and support.InAsyncDef(l) for l in logicals]
+    flags = [version in ('3.5', '3.6') and support.InAsyncDef(l) for l in logicals]
     results = []
     best = TimeTreelens(analysis.GetAnalyzer(version).Impl(), logicals, repeat, flags, results)
     return best, sum(1 for r in results if r is not None)
@@ -272,6 +282,67 @@ def main():
     print('treelens 3.8 analyzer: %7.3f us/line (%d lines rejected)' % (new * 1e6 / n, new_rejected))
     print('treelens 3.6 analyzer, same lines: %7.3f us/line (%d lines rejected)' % (old * 1e6 / n, old_rejected))
     print('ratio 3.8 / 3.6 analyzer: %.3f' % (new / old))
+    TimeNewestVersion(repeat, int(sys.argv[5]) if len(sys.argv) > 5 else py38_limit)
+
+
+def TimeAuto(files, repeat, order=None):
+    """Best seconds of AnalyzeText(..., 'auto') over the files, and their logical lines;
+    order replaces the versions auto tries."""
+    from pysource import analysis
+    texts = [support.ReadBytes(p) for p in files]
+    saved = analysis.kAutoOrder
+    if order:
+        analysis.kAutoOrder = order
+    try:
+        best, lines = None, 0
+        for _ in range(repeat):
+            gc.collect()
+            start = time.time()
+            lines = sum(len(analysis.AnalyzeText(t).logicals) for t in texts)
+            elapsed = time.time() - start
+            best = elapsed if best is None else min(best, elapsed)
+    finally:
+        analysis.kAutoOrder = saved
+    return best, lines
+
+
+def TimeNewestVersion(repeat, limit):
+    """The 3.13 analyzer against 3.8's on the 3.13 standard library lines both
+    accept, and auto on the 3.13 standard library against auto as it was
+    before 3.9 (trying 3.8 first) on the 3.8 standard library."""
+    from pysource import analysis
+    files = support.CorpusFiles('3.13', limit=limit)
+    if not files:
+        print('no Python 3.13 standard library: 3.13 analyzer not timed')
+        return
+    logicals = []
+    for path in files:
+        logicals.extend(GetLogicalsFromText(support.ReadBytes(path)))
+    verdicts = {}
+    for version in ('3.13', '3.8'):
+        results = []
+        TimeTreelens(analysis.GetAnalyzer(version).Impl(), logicals, 1, None, results)
+        verdicts[version] = results
+    both = [l for l, a, b in zip(logicals, verdicts['3.13'], verdicts['3.8']) if a is None and b is None]
+    n = len(both)
+    new, old = [min(t) for t in zip(*[(TimeVersion('3.13', both, 1)[0], TimeVersion('3.8', both, 1)[0])
+                                      for _ in range(repeat)])]
+    print('3.13 standard library logical lines: %d, accepted by both the 3.13 and 3.8 analyzers: %d'
+          % (len(logicals), n))
+    print('treelens 3.13 analyzer: %7.3f us/line' % (new * 1e6 / n))
+    print('treelens 3.8 analyzer, same lines: %7.3f us/line' % (old * 1e6 / n))
+    print('ratio 3.13 / 3.8 analyzer: %.3f' % (new / old))
+    files38 = support.CorpusFiles('3.8', limit=limit)
+    old_order = ('3.8', '3.7', '3.6', '3.5', '2.7')
+    TimeAuto(files, 1)  # every version's analyzer made once, outside the timings
+    # Alternated, so that a busy spell of the machine hits both alike.
+    runs = [(TimeAuto(files, 1), TimeAuto(files38, 1, old_order)) for _ in range(repeat)]
+    auto, lines = min(r[0] for r in runs)
+    auto38, lines38 = min(r[1] for r in runs)
+    print('auto (3.13 first) on the 3.13 standard library: %7.3f us/line (%d lines)' % (auto * 1e6 / lines, lines))
+    print('auto trying 3.8 first on the 3.8 standard library: %7.3f us/line (%d lines)'
+          % (auto38 * 1e6 / lines38, lines38))
+    print('ratio auto 3.13 / auto 3.8, per line: %.3f' % ((auto / lines) / (auto38 / lines38)))
 
 
 if __name__ == '__main__':

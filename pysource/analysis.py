@@ -9,7 +9,7 @@
     for result in analysis.AnalyzeFolder('src'):              # 'auto' by default
         print(result.path, result.version, result.status, len(result.SyntaxErrors()))
 
-A version is '2.7', '3.5', '3.6', '3.7', '3.8' or 'auto'. Each version has one
+A version is '2.7', '3.5' to '3.13' or 'auto'. Each version has one
 analyzer with its grammar, keyword list and the Python 3 hint grammar; a 2.7
 module that imports print_function from __future__ gets the 2.7 grammar
 variant without the print statement. 'auto' picks, per file, the newest version under which no
@@ -37,10 +37,10 @@ from pysource import filechecks
 from pysource import symbolinfo
 from pysource import utils
 
-kVersions = ('2.7', '3.5', '3.6', '3.7', '3.8')
+kVersions = ('2.7', '3.5', '3.6', '3.7', '3.8', '3.9', '3.10', '3.11', '3.12', '3.13')
 kAuto = 'auto'
-# The order in which 'auto' tries the versions.
-kAutoOrder = ('3.8', '3.7', '3.6', '3.5', '2.7')
+# The order in which 'auto' tries the versions: the newest first.
+kAutoOrder = ('3.13', '3.12', '3.11', '3.10', '3.9', '3.8', '3.7', '3.6', '3.5', '2.7')
 kSourceSuffixes = ('.py', '.pyi')
 
 # The grammar of type hints is a Python 3 one whatever the version of the code.
@@ -65,11 +65,24 @@ kGrammars = {
     '3.6': ((3, 6, 0), 'Python-Grammar-3.6', True),
     '3.7': ((3, 7, 0), 'Python-Grammar-3.7', True),
     '3.8': ((3, 8, 0), 'Python-Grammar-3.8', True),
+    '3.9': ((3, 9, 0), 'Python-Grammar-3.9', True),
+    '3.10': ((3, 10, 0), 'Python-Grammar-3.10', True),
+    '3.11': ((3, 11, 0), 'Python-Grammar-3.11', True),
+    '3.12': ((3, 12, 0), 'Python-Grammar-3.12', True),
+    '3.13': ((3, 13, 0), 'Python-Grammar-3.13', True),
 }
 
 # Version -> keyword list of a Python 3 version.
 kKeywords = {'3.5': kPy3Keywords, '3.6': kPy3Keywords,
-             '3.7': kPy37Keywords, '3.8': kPy37Keywords}
+             '3.7': kPy37Keywords, '3.8': kPy37Keywords, '3.9': kPy37Keywords,
+             '3.10': kPy37Keywords, '3.11': kPy37Keywords, '3.12': kPy37Keywords,
+             '3.13': kPy37Keywords}
+
+# Version -> soft keywords: names that are keywords only where the grammar
+# places them (the parser retypes match and case at the start of a line and
+# type before a name; _ is the wildcard pattern), names everywhere else.
+kSoftKeywords = {'3.10': ('_', 'case', 'match'), '3.11': ('_', 'case', 'match'),
+                 '3.12': ('_', 'case', 'match', 'type'), '3.13': ('_', 'case', 'match', 'type')}
 
 kKindNames = {0: 'stmt', 1: 'class', 2: 'def', 11: 'try', 21: 'comment', 22: 'blank'}
 
@@ -403,6 +416,11 @@ _kTokenChecks = {
     '3.6': (re.compile(_kPy3Hint), _Py3TokenError),
     '3.7': (re.compile(_kPy3Hint), _Py3TokenError),
     '3.8': (re.compile(_kPy3Hint), _Py3TokenError),
+    '3.9': (re.compile(_kPy3Hint), _Py3TokenError),
+    '3.10': (re.compile(_kPy3Hint), _Py3TokenError),
+    '3.11': (re.compile(_kPy3Hint), _Py3TokenError),
+    '3.12': (re.compile(_kPy3Hint), _Py3TokenError),
+    '3.13': (re.compile(_kPy3Hint), _Py3TokenError),
 }
 
 
@@ -442,7 +460,7 @@ kCommentKind, kBlankKind = 21, 22
 _kOpening = (7, 9, 26)   # ( [ {
 _kClosing = (8, 10, 27)
 # Versions whose lexer matches brackets and says which do not pair.
-_kBracketsChecked = ('3.8',)
+_kBracketsChecked = ('3.8', '3.9', '3.10', '3.11', '3.12', '3.13')
 
 
 def _BracketError(logical, end):

@@ -112,6 +112,11 @@ def Check(version, logicals, errors, text, path=None, checks=True):
     if checks:
         _FutureImports(version, logicals, statements, found)
         _Loops(version, logicals, statements, errors, found)
+        # Two more passes over the statements only for a text that may need them.
+        if _Triple(version) >= (3, 10) and (text is None or _kCaseLine.search(text) and _kMatchLine.search(text)):
+            _MatchCases(version, logicals, statements, errors, found)
+        if _Triple(version) >= (3, 11) and (text is None or _kExceptStar.search(text)):
+            _ExceptStars(logicals, statements, errors, found)
 
 
 # ---- encoding
@@ -525,3 +530,65 @@ def _CheckLoop(version, logical, index, words, stack, found):
         message = "'break' outside loop" if word == b'break' else "'continue' not properly in loop"
     row, col = logical.fTokens[i][1]
     found.Add(_kCompile, index, MakeError(logical, message, row, col, _CompileOffset(version, col)))
+
+
+# ---- match statements and except* (3.10, 3.11)
+
+_kKeywordWords = frozenset([b'None', b'True', b'False'])
+_kExceptStar = re.compile(br'except[ \t\f\\\r\n]*\*')
+_kCaseLine = re.compile(br'(?m)^[ \t\f]*case\b')
+_kMatchLine = re.compile(br'(?m)^[ \t\f]*match\b')
+
+
+def _MatchCases(version, logicals, statements, errors, found):
+    """A case whose pattern is a lone capture or `_` and has no guard matches
+    everything: CPython rejects it when another case of its match follows."""
+    stack = []      # [match indent, case indent, (index, error) of an irrefutable case]
+    for index in statements:
+        logical = logicals[index]
+        indent = logical.fIndent
+        while stack and stack[-1][0] >= indent:
+            stack.pop()
+        first = logical.GetTokenString(0) if logical.fTokenCount else b''
+        if first not in (b'match', b'case') or errors[index] is not None:
+            continue
+        words = _Words(logical)
+        if first == b'case' and stack and stack[-1][1] in (None, indent):
+            top = stack[-1]
+            top[1] = indent
+            if top[2] is not None:
+                found.Add(_kCompile, *top[2])
+                top[2] = None
+            if (len(words) > 2 and words[2] == b':' and words[1] not in _kKeywordWords
+                    and re.match(br'[A-Za-z_][A-Za-z_0-9]*\Z', words[1])):
+                i = _SignificantTokens(logical)[1]
+                row, col = logical.fTokens[i][1]
+                message = ('wildcard makes remaining patterns unreachable' if words[1] == b'_' else
+                           "name capture '%s' makes remaining patterns unreachable" % words[1])
+                top[2] = (index, MakeError(logical, message, row, col, _CompileOffset(version, col)))
+        elif first == b'match' and words[-1:] == [b':'] and len(words) > 2 and words[1] not in (b'=', b'.'):
+            stack.append([indent, None, None])
+
+
+def _ExceptStars(logicals, statements, errors, found):
+    """One try statement may not have both except and except* clauses."""
+    stack = []      # [indent of a try, b'*' or b'' once a clause says which]
+    for index in statements:
+        logical = logicals[index]
+        indent = logical.fIndent
+        words = None
+        first = logical.GetTokenString(0) if logical.fTokenCount else b''
+        while stack and (stack[-1][0] > indent or (stack[-1][0] == indent and first not in (
+                b'except', b'else', b'finally'))):
+            stack.pop()
+        if first == b'try':
+            stack.append([indent, None])
+        elif first == b'except' and stack and stack[-1][0] == indent and errors[index] is None:
+            words = _Words(logical)
+            star = b'*' if words[1:2] == [b'*'] else b''
+            if stack[-1][1] is None:
+                stack[-1][1] = star
+            elif stack[-1][1] != star:
+                row, col = logical.fTokens[0][1]
+                found.Add(_kParse, index, MakeError(
+                    logical, "cannot have both 'except' and 'except*' on the same 'try'", row, col, col + 1))

@@ -56,6 +56,7 @@ kInstanceKind = b'I'                # an instance of a class
 kModuleKind = b'o'                  # a module
 kInferredTypeHintKind = b'y'        # a type inferred from the code, not declared
 kCalledKind = b'r'                  # the result of calling the name
+kTypeParamKind = b't'               # a type parameter of a def, class or type statement ('*' or '**' follows for *Ts, **P)
 kPlainEquivKind = b'='              # a plain equivalence (no prefix)
 
 kSetPrefix = _Prefix(kSetKind)
@@ -85,6 +86,7 @@ kInstancePrefix = _Prefix(kInstanceKind)
 kModulePrefix = _Prefix(kModuleKind)
 kInferredTypeHintPrefix = _Prefix(kInferredTypeHintKind)
 kCalledPrefix = _Prefix(kCalledKind)
+kTypeParamPrefix = _Prefix(kTypeParamKind)
 # Marks an explicit plain equivalence whose text itself begins with ":".
 kPlainEquivSpec = _Prefix(kPlainEquivKind)
 

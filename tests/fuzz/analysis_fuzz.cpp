@@ -26,7 +26,9 @@ reflect.ReportCurrentException = lambda *a, **k: _reported.append(1)
 logging.disable(logging.CRITICAL)
 _analyzers = [tl.CPGenAnalyzerImpl((2, 7, 0), tl.kPy2DefaultGrammar, None, False),
               tl.CPGenAnalyzerImpl((3, 6, 0)), tl.CPGenAnalyzerImpl((3, 7, 0), 'Python-Grammar-3.7'),
-              tl.CPGenAnalyzerImpl((3, 8, 0), 'Python-Grammar-3.8')]
+              tl.CPGenAnalyzerImpl((3, 8, 0), 'Python-Grammar-3.8'),
+              tl.CPGenAnalyzerImpl((3, 10, 0), 'Python-Grammar-3.10', syntax_checks=True),
+              tl.CPGenAnalyzerImpl((3, 13, 0), 'Python-Grammar-3.13', syntax_checks=True)]
 
 def _Check(result):
     assert result is None or isinstance(result, SyntaxError), repr(result)

@@ -73,12 +73,21 @@ class Collector(ast.NodeVisitor):
         self.bound, self.loads, self.within = [], set(), []
         self.globals, self.nonlocals = [], []
         self.args = self.bases = None
+        self.typeparams = []
 
     def visit_Name(self, node):
         if isinstance(node.ctx, ast.Load) and node.id not in kLiteralNames:
             self.loads.add(node.id)
 
+    def TypeParams(self, node):
+        """Type parameters (3.12) bind in the definition's own scope: they are
+        their own fact; their bounds and defaults are read."""
+        for param in getattr(node, 'type_params', None) or []:
+            self.typeparams.append(param.name)
+            self.generic_visit(param)
+
     def visit_FunctionDef(self, node):
+        self.TypeParams(node)
         self.args = ParamNames(node.args)
         for sub in node.decorator_list + node.args.defaults + list(getattr(node.args, 'kw_defaults', [])):
             if sub is not None:
@@ -94,6 +103,7 @@ class Collector(ast.NodeVisitor):
     visit_AsyncFunctionDef = visit_FunctionDef
 
     def visit_ClassDef(self, node):
+        self.TypeParams(node)
         bases = [b for b in node.bases if not (getattr(ast, 'Starred', None) and isinstance(b, ast.Starred))]
         self.bases = [d for d in (Dotted(b) for b in bases) if d is not None]
         for sub in node.decorator_list:
@@ -162,6 +172,27 @@ class Collector(ast.NodeVisitor):
             if alias.name != '*':
                 self.bound.append(alias.asname or alias.name)
 
+    def visit_TypeAlias(self, node):
+        TargetNames(node.name, self.bound)
+        self.TypeParams(node)
+        self.visit(node.value)
+
+    # Patterns: captures, star captures and mapping rests bind (the wildcard
+    # has no name); value and class patterns read through their Name nodes.
+    def visit_MatchAs(self, node):
+        if node.name is not None:
+            self.bound.append(node.name)
+        self.generic_visit(node)
+
+    def visit_MatchStar(self, node):
+        if node.name is not None:
+            self.bound.append(node.name)
+
+    def visit_MatchMapping(self, node):
+        if node.rest is not None:
+            self.bound.append(node.rest)
+        self.generic_visit(node)
+
     def visit_Global(self, node):
         self.globals.extend(node.names)
 
@@ -182,7 +213,7 @@ def Facts(source, fstring_reads=False):
     c = Collector(fstring_reads)
     c.visit(tree)
     return {'bound': c.bound, 'loads': sorted(c.loads), 'within': c.within, 'globals': c.globals,
-            'nonlocals': c.nonlocals, 'args': c.args, 'bases': c.bases}
+            'nonlocals': c.nonlocals, 'args': c.args, 'bases': c.bases, 'typeparams': c.typeparams}
 
 
 def Main(fstring_reads=False):

@@ -22,8 +22,11 @@ from tests.py import support
 
 kComment = 202
 # Lines a line-by-line analyzer cannot judge alone: clauses that continue a
-# statement above them, and decorators, which need the def below.
+# statement above them, and decorators, which need the def below; from 3.10
+# also a match statement's header and case clauses (the names match and case
+# lead ordinary statements too; those are left out with them).
 kContinuations = (b'else', b'elif', b'except', b'finally', b'try', b'@')
+kSoftKeywordHeads = (b'match', b'case')
 kPool = (b'=', b'(', b')', b'[', b']', b',', b'*', b'**', b'.', b':', b'+', b'-', b'==', b'<>', b'+=',
          b'lambda', b'yield', b'return', b'None', b'True', b'False', b'__debug__', b'not', b'in', b'if',
          b'else', b'for', b'del', b'await', b'async', b'global', b'nonlocal', b'break', b'continue',
@@ -46,13 +49,16 @@ kContexts = {
 def Statements(version, files):
     """Token lists of the one-line statements of some files (comments dropped)."""
     found = []
+    heads = kContinuations
+    if version not in ('2.7', '3.5', '3.6', '3.7', '3.8', '3.9'):
+        heads += kSoftKeywordHeads
     for path in files:
         for logical in utils.GetLogicalsFromText(support.ReadBytes(path)):
             if logical.fLineText.count(b'\n') != 1 or logical.fTokenCount == 0:
                 continue
             toks = [logical.GetTokenString(i) for i in range(logical.fTokenCount)]
             toks = [t for t in toks if _fastaccess.GetTokenType(t) != kComment]
-            if toks and not toks[0].startswith(kContinuations) and len(toks) < 40:
+            if toks and not toks[0].startswith(heads) and len(toks) < 40:
                 found.append(toks)
     return found
 

@@ -23,35 +23,63 @@ def Errors(text, version, checks=True):
     return [(line, col) for line, col, _ in analysis.AnalyzeText(text, version, checks=checks).SyntaxErrors()]
 
 
+def Since(version):
+    """The Python 3 versions from `version` on, as a space-separated string."""
+    return ' '.join(v for v in analysis.kVersions if v != '2.7' and Triple(v) >= Triple(version))
+
+
+def Triple(version):
+    return tuple(int(p) for p in version.split('.'))
+
+
 class VersionTest(unittest.TestCase):
 
     def testEachVersionAcceptsItsOwnSyntax(self):
         # source, versions that accept it
+        py3 = Since('3.5')
         cases = [(b'print x\n', '2.7'),
                  (b'exec "x" in d\n', '2.7'),
                  (b'x = 0777 + 10L + 0xFFL\n', '2.7'),
                  (b"x = ur'a' if a <> b else 1\n", '2.7'),
-                 (b"x = '\\u00e9'; y = b'\\u'; z = r'\\N'\n", '2.7 3.5 3.6 3.7 3.8'),
+                 (b"x = '\\u00e9'; y = b'\\u'; z = r'\\N'\n", '2.7 ' + py3),
                  (b"x = '\\u'\n", '2.7'),
-                 (b"x = '\\N{DASH}'\n", '2.7 3.5 3.6 3.7 3.8'),
-                 (b'x = 1_000\n', '3.6 3.7 3.8'),
-                 (b"x = f'{y}'\n", '3.6 3.7 3.8'),
-                 (b'x: int = 1\n', '3.6 3.7 3.8'),
-                 (b"x = rb'a'\n", '3.5 3.6 3.7 3.8'),
-                 (b'print(x, file=f)\n', '3.5 3.6 3.7 3.8'),
-                 (b'from __future__ import print_function\nprint(x, file=f)\n', '2.7 3.5 3.6 3.7 3.8'),
-                 (b'x = 0; y = 00; z = 0.5 + 07.5 + 0e1 + 0777j\n', '2.7 3.5 3.6 3.7 3.8'),
+                 (b"x = '\\N{DASH}'\n", '2.7 ' + py3),
+                 (b'x = 1_000\n', Since('3.6')),
+                 (b"x = f'{y}'\n", Since('3.6')),
+                 (b'x: int = 1\n', Since('3.6')),
+                 (b"x = rb'a'\n", py3),
+                 (b'print(x, file=f)\n', py3),
+                 (b'from __future__ import print_function\nprint(x, file=f)\n', '2.7 ' + py3),
+                 (b'x = 0; y = 00; z = 0.5 + 07.5 + 0e1 + 0777j\n', '2.7 ' + py3),
                  # async and await: names up to 3.6, keywords everywhere from 3.7.
                  (b'async = await = 1\n', '2.7 3.5 3.6'),
-                 (b'def f():\n    return (await x async for x in y)\n', '3.7 3.8'),
+                 (b'def f():\n    return (await x async for x in y)\n', Since('3.7')),
                  # 3.8: assignment expressions, positional-only parameters, starred returns.
-                 (b'if (n := len(a)) > 1: f(x := 2)\n', '3.8'),
-                 (b'def f(a, /, b): return *a, b\n', '3.8'),
-                 (b"x = f'{y=}'\n", '3.8')]
+                 (b'if (n := len(a)) > 1: f(x := 2)\n', Since('3.8')),
+                 (b'def f(a, /, b): return *a, b\n', Since('3.8')),
+                 (b"x = f'{y=}'\n", Since('3.8')),
+                 # 3.9: any decorator, parenthesized with items, starred for, set displays.
+                 (b'@buttons[0].clicked.connect\ndef f(): pass\n', Since('3.9')),
+                 (b'with (open(a) as f, open(b) as g,): pass\n', Since('3.9')),
+                 (b'with (a, b) as c: pass\n', '2.7 ' + py3),
+                 (b'for x in *a, *b: pass\n', Since('3.9')),
+                 (b'x = {y := 1, 2}\n', Since('3.9')),
+                 # 3.10: match statements, assignment expressions in subscripts; the soft
+                 # keywords stay names elsewhere.
+                 (b'match p:\n    case Point(x=0, y=y) | [_, *y] if y: pass\n    case _: pass\n', Since('3.10')),
+                 (b'match(x)\nmatch = case = _ = 1\ncase.x, match[1:2]\n', '2.7 ' + py3),
+                 (b'x[y := 1]\n', Since('3.10')),
+                 # 3.11: except*, starred subscripts and annotations.
+                 (b'try:\n    pass\nexcept* E as e:\n    pass\n', Since('3.11')),
+                 (b'def f(*args: *Ts): return x[*a, b]\n', Since('3.11')),
+                 # 3.12: type parameters and the type statement; 3.13: their defaults.
+                 (b'class C[T: int, *Ts, **P](B): pass\ntype X[T] = list[T]\n', Since('3.12')),
+                 (b'type = 1\ntype(x)\n', '2.7 ' + py3),
+                 (b'def f[T = int](x: T): pass\n', Since('3.13'))]
         for text, accepting in cases:
             for version in analysis.kVersions:
                 errors = Errors(text, version)
-                self.assertEqual(errors == [], version in accepting, (text, version, errors))
+                self.assertEqual(errors == [], version in accepting.split(), (text, version, errors))
 
     def testTokenErrorsPointAtTheToken(self):
         result = analysis.AnalyzeText(b'x = 1\ny = (1 +\n     0777)\n', '3.6')
@@ -79,14 +107,15 @@ class VersionTest(unittest.TestCase):
 
     def testAutoPicksTheNewestVersionWithoutErrors(self):
         # source, version picked, errors kept
-        cases = [(b'', '3.8', []),
-                 (b'x = 1\n', '3.8', []),
+        cases = [(b'', '3.13', []),
+                 (b'x = 1\n', '3.13', []),
                  (b'x = 1\nprint x\n', '2.7', []),
                  (b'def f():\n    x = 0777\n', '2.7', []),
-                 (b'print(x, end="")\nx = 1_0\n', '3.8', []),
+                 (b'print(x, end="")\nx = 1_0\n', '3.13', []),
                  (b'async = 1\nx = f"{async}"\n', '3.6', []),
-                 (b'print x\ny = f"{x}"\n', '3.8', [(1, 7)]),
-                 (b'if x\n', '3.8', [(1, 5)]),
+                 (b'match x:\n    case 1: pass\nasync = 1\n', '3.13', [(3, 7)]),
+                 (b'print x\ny = f"{x}"\n', '3.13', [(1, 7)]),
+                 (b'if x\n', '3.13', [(1, 5)]),
                  # No version parses it: the fewest lines in error, the newest on a tie.
                  (b'print "x"\ny = 1\nx = (\n', '2.7', [(3, 6)]),
                  (b'async = 1\nx = f"{async}"\ny = 1L\n', '3.6', [(3, 5)])]
@@ -232,8 +261,8 @@ class FolderTest(unittest.TestCase):
                for r in analysis.AnalyzeFolder(self.tmp)]
         self.assertEqual(got, [('a/gone.py', None, analysis.kUnreadable),
                                ('a/loop', None, analysis.kSkipped),
-                               ('a/y.py', '3.8', analysis.kOk),
-                               ('a/z.pyi', '3.8', analysis.kOk),
+                               ('a/y.py', '3.13', analysis.kOk),
+                               ('a/z.pyi', '3.13', analysis.kOk),
                                ('b.py', '2.7', analysis.kOk)])
         self.assertEqual(analysis.WorstStatus(s for _, _, s in got), analysis.kUnreadable)
         result = analysis.AnalyzeFile(os.path.join(self.tmp, 'a', 'gone.py'))

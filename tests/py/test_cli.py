@@ -74,7 +74,7 @@ class CliTest(unittest.TestCase):
         status, out, err = Treelens('-q', good, bad)
         self.assertEqual((status, err), (1, b''))
         self.assertIn(bad + b':2: [stmt] if x\n    error: 2:5: invalid syntax\n', out)
-        for argv in (['--bogus', good], ['-j', '0', good], ['--lang', '3.9', good], []):
+        for argv in (['--bogus', good], ['-j', '0', good], ['--lang', '3.14', good], []):
             status, out, err = Treelens(*argv)
             self.assertEqual((status, out), (2, b''), argv)
             self.assertIn(b'usage: treelens', err)
@@ -118,12 +118,12 @@ class CliTest(unittest.TestCase):
         for name, text in texts.items():
             entry = [f for f in files if f['path'] == paths[name]][0]
             self.assertEqual((entry['status'], entry['version'], entry['problem']),
-                             ('ok', '3.8', None), name)
+                             ('ok', '3.13', None), name)
             bom = 3 if text.startswith(b'\xef\xbb\xbf') else 0
             self.assertEqual(b''.join(Lossless(l['text']) for l in entry['lines']), text[bom:], name)
             self.assertEqual([l for l in lines if l['path'] == paths[name]],
-                             [dict(l, path=paths[name], version='3.8') for l in entry['lines']]
-                             or [{'path': paths[name], 'version': '3.8', 'status': 'ok',
+                             [dict(l, path=paths[name], version='3.13') for l in entry['lines']]
+                             or [{'path': paths[name], 'version': '3.13', 'status': 'ok',
                                   'problem': None}])
         line = [f for f in files if f['path'] == paths['latin1.py']][0]['lines'][1]
         self.assertEqual((line['defines'], line['reads'], line['equivs'], line['error']),
@@ -143,8 +143,8 @@ class CliTest(unittest.TestCase):
         status, out, err = Treelens('--format', 'jsonl', '-q', 'pkg', cwd=self.tmp)
         self.assertEqual(status, 0, err)
         self.assertEqual([(l['path'], l['version']) for l in map(json.loads, out.splitlines())],
-                         [('pkg/new.py', '3.8'), ('pkg/new36.py', '3.6'), ('pkg/new38.py', '3.8'),
-                          ('pkg/new38.py', '3.8'), ('pkg/old.py', '2.7'), ('pkg/sub/up', None),
+                         [('pkg/new.py', '3.13'), ('pkg/new36.py', '3.6'), ('pkg/new38.py', '3.13'),
+                          ('pkg/new38.py', '3.13'), ('pkg/old.py', '2.7'), ('pkg/sub/up', None),
                           ('pkg/up', None)])
         for lang, status_wanted in (('3.7', 1), ('3.8', 0)):
             self.assertEqual(Treelens('-q', '--lang', lang, 'pkg/new38.py', cwd=self.tmp)[0], status_wanted, lang)

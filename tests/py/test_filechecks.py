@@ -54,6 +54,16 @@ kJudged = [
     b'# coding: utf-8\nx = "\xe2\x82\xac"  # \xe2\x82\xac\n',
 ]
 
+# 3.10 and 3.11: what only the whole match statement or try statement shows.
+kJudgedNew = [
+    b'match x:\n    case a: pass\n    case 1: pass\n', b'match x:\n    case _:\n        pass\n    case 1: pass\n',
+    b'match x:\n    case a if a: pass\n    case 1: pass\n', b'match x:\n    case 1: pass\n    case a: pass\n',
+    b'match x:\n    case a:\n        match y:\n            case 1: pass\nz = 1\n',
+    b'try:\n    pass\nexcept* E:\n    pass\nexcept F:\n    pass\n',
+    b'try:\n    pass\nexcept E:\n    pass\nexcept* F:\n    pass\n',
+    b'try:\n    try: pass\n    except E: pass\nexcept* F:\n    pass\n',
+]
+
 # Errors CPython gives for the whole file (line 0), or only when it runs a
 # file: (source, version or None for all, message, line).
 kWritten = [
@@ -94,6 +104,17 @@ class FileChecksTest(unittest.TestCase):
                 continue
             wrong = [(version, source, want, FirstError(version, source)[0])
                      for source, want in zip(kJudged, theirs)
+                     if FirstError(version, source)[0] != want]
+            self.assertEqual(wrong, [])
+
+    def testMatchAndExceptStarAgainstCPython(self):
+        for version in ('3.10', '3.11', '3.12', '3.13'):
+            sources = [s for s in kJudgedNew if b'except*' not in s or version != '3.10']
+            theirs = mutants.Verdicts(version, sources)
+            if theirs is None:
+                continue
+            wrong = [(version, source, want, FirstError(version, source)[0])
+                     for source, want in zip(sources, theirs)
                      if FirstError(version, source)[0] != want]
             self.assertEqual(wrong, [])
 

@@ -28,11 +28,12 @@ from pysource import _pgengen
 from tests.py import support
 
 kGrammarDir = os.path.join(support.kRoot, 'resources', 'pgen-grammars')
-kVersions = ('2.7', '3.5', '3.6', '3.7', '3.8')
+kVersions = ('2.7', '3.5', '3.6', '3.7', '3.8', '3.9', '3.10', '3.11', '3.12', '3.13')
 
 # Token numbering the analyzer passes to the parser generator.
 kTokNumber2Name = dict(token.tok_name)
-kTokNumber2Name.update({51: 'RARROW', 53: 'AWAIT', 54: 'ASYNC', 55: 'COLONEQUAL', 56: 'ATEQUAL'})
+kTokNumber2Name.update({51: 'RARROW', 53: 'AWAIT', 54: 'ASYNC', 55: 'COLONEQUAL', 56: 'ATEQUAL', 60: 'MATCH',
+                        61: 'CASE', 62: 'TYPE', 63: 'WITH_LPAR'})
 kOpText2Number = dict(pgen_grammar.opmap)
 kOpText2Number.update({'...': 52, '->': 51, ':=': 55, '@=': 56})
 NAME, NUMBER, STRING, NEWLINE, ENDMARKER = 1, 2, 3, 4, 0
@@ -614,6 +615,24 @@ kRulesByVersion['3.8'] = [r for r in kRules35 if not r.startswith('yield_arg')] 
     "testlist_comp: (namedexpr_test|star_expr) ( comp_for | (',' (namedexpr_test|star_expr))* [','] )",
 ]
 
+# 3.9: any expression after '@'; 3.10: case clauses and patterns; 3.11: except* and the
+# starred annotation of '*args'; 3.12: type parameters and the type statement.
+kRulesByVersion['3.9'] = [r for r in kRulesByVersion['3.8'] if not r.startswith('decorator:')]
+kRulesByVersion['3.10'] = kRulesByVersion['3.9'] + [
+    "case_block: CASE patterns [guard] ':' suite",
+    "pattern: or_pattern ['as' NAME]",
+    "name_pattern: NAME ('.' NAME)* ['(' [class_arg (',' class_arg)* [',']] ')']",
+    "mapping_item: (literal_pattern | value_name) ':' pattern | '**' NAME",
+]
+kRulesByVersion['3.11'] = [r for r in kRulesByVersion['3.10'] if not r.startswith('except_clause:')] + [
+    "tfpdef_star: NAME [':' (test | star_expr)]",
+]
+kRulesByVersion['3.12'] = kRulesByVersion['3.11'] + [
+    "type_params: '[' type_param (',' type_param)* [','] ']'",
+    "type_stmt: TYPE NAME [type_params] '=' test",
+]
+kRulesByVersion['3.13'] = kRulesByVersion['3.12']
+
 kCommonStates = ['with_stmt', 'with_item', 'pass_stmt', 'expr_stmt',
                  'return_stmt', 'power', 'trailer', 'atom', 'funcdef',
                  'global_stmt', 'lambdef', 'parameters', 'varargslist',
@@ -631,6 +650,11 @@ kStatesByVersion = {
 kStatesByVersion['3.6'] = kStatesByVersion['3.5'] + ['annassign']
 kStatesByVersion['3.7'] = kStatesByVersion['3.6']
 kStatesByVersion['3.8'] = kStatesByVersion['3.6'] + ['namedexpr_test']
+kStatesByVersion['3.9'] = kStatesByVersion['3.8']
+kStatesByVersion['3.10'] = kStatesByVersion['3.9'] + ['match_stmt', 'case_block', 'guard', 'patterns']
+kStatesByVersion['3.11'] = kStatesByVersion['3.10'] + ['tfpdef_star']
+kStatesByVersion['3.12'] = kStatesByVersion['3.11'] + ['type_params', 'type_param', 'type_stmt']
+kStatesByVersion['3.13'] = kStatesByVersion['3.12']
 kAbsentByVersion = {
     '2.7': ['atom_expr', 'nonlocal_stmt', 'star_expr', 'annassign',
             'async_stmt', 'typedargslist', 'namedexpr_test'],
@@ -638,12 +662,19 @@ kAbsentByVersion = {
     '3.6': ['print_stmt', 'exec_stmt', 'list_for', 'fplist', 'namedexpr_test'],
     '3.7': ['print_stmt', 'exec_stmt', 'list_for', 'fplist', 'namedexpr_test'],
     '3.8': ['print_stmt', 'exec_stmt', 'list_for', 'fplist'],
+    '3.9': ['print_stmt', 'exec_stmt', 'list_for', 'fplist', 'match_stmt'],
+    '3.10': ['print_stmt', 'exec_stmt', 'list_for', 'fplist', 'tfpdef_star'],
+    '3.11': ['print_stmt', 'exec_stmt', 'list_for', 'fplist', 'type_params'],
+    '3.12': ['print_stmt', 'exec_stmt', 'list_for', 'fplist'],
+    '3.13': ['print_stmt', 'exec_stmt', 'list_for', 'fplist'],
 }
 
 # Single logical lines (source text) and the versions whose grammar accepts them.
-kAll = ('2.7', '3.5', '3.6', '3.7', '3.8')
-kPy3 = ('3.5', '3.6', '3.7', '3.8')
-kPy36 = ('3.6', '3.7', '3.8')
+kNewer = ('3.9', '3.10', '3.11', '3.12', '3.13')
+kAll = ('2.7', '3.5', '3.6', '3.7', '3.8') + kNewer
+kPy3 = ('3.5', '3.6', '3.7', '3.8') + kNewer
+kPy36 = ('3.6', '3.7', '3.8') + kNewer
+kPy38On = ('3.8',) + kNewer
 kSnippets = [
     ('x = 1', kAll),
     ('a, b = b, a', kAll),
@@ -710,7 +741,7 @@ kSnippets = [
     ('class A():', kAll),
     ('@property', kAll),
     ('@a.b(c, d=1)', kAll),
-    ('@a[0]', ()),
+    ('@a[0]', kNewer),
     ('elif x:', kAll),
     ('else:', kAll),
     ('finally:', kAll),
@@ -738,33 +769,36 @@ kSnippets = [
     ('x = a $ b', ()),
     # 3.8: assignment expressions where CPython 3.8's grammar has them, positional-only
     # parameters, starred values after return, yield and an annotated assignment's '='.
-    ('if (n := len(a)) > 10: pass', ('3.8',)),
-    ('if x := f(): pass', ('3.8',)),
-    ('elif x := f(): pass', ('3.8',)),
-    ('while chunk := read(): pass', ('3.8',)),
-    ('x = [y := f(x), y ** 2]', ('3.8',)),
-    ('x = [y for x in d if (y := f(x))]', ('3.8',)),
-    ('x = [y := 1 for x in d]', ('3.8',)),
-    ('f(x := 1, y=2)', ('3.8',)),
+    ('if (n := len(a)) > 10: pass', kPy38On),
+    ('if x := f(): pass', kPy38On),
+    ('elif x := f(): pass', kPy38On),
+    ('while chunk := read(): pass', kPy38On),
+    ('x = [y := f(x), y ** 2]', kPy38On),
+    ('x = [y for x in d if (y := f(x))]', kPy38On),
+    ('x = [y := 1 for x in d]', kPy38On),
+    ('f(x := 1, y=2)', kPy38On),
     ('x := 1', ()),
     ('x = y := 1', ()),
     ('x = [y for x in d if y := f(x)]', ()),
-    ('x = {y := 1}', ()),
-    ('x = a[y := 1]', ()),
+    ('x = {y := 1}', kNewer),
+    ('x = a[y := 1]', kNewer[1:]),
     ('f(x := 1 for x in y)', ()),
     ('f(a=b := 1)', ()),
-    ('def f(a, b=1, /, c=2, *, d): pass', ('3.8',)),
-    ('def f(a: int, /): pass', ('3.8',)),
-    ('def f(a, /,): pass', ('3.8',)),
-    ('lambda a, /, b: a', ('3.8',)),
+    ('def f(a, b=1, /, c=2, *, d): pass', kPy38On),
+    ('def f(a: int, /): pass', kPy38On),
+    ('def f(a, /,): pass', kPy38On),
+    ('lambda a, /, b: a', kPy38On),
     ('def f(/, a): pass', ()),
     ('def f(a, /, /): pass', ()),
     ('def f(*a, /): pass', ()),
-    ('return *a, b', ('3.8',)),
-    ('x = yield *a, b', ('3.8',)),
-    ('x: T = 1, 2', ('3.8',)),
-    ('x: T = yield', ('3.8',)),
-    ('return *a', ('3.8',)),  # as in CPython 3.8's grammar; its compiler rejects the lone star
+    ('return *a, b', kPy38On),
+    ('x = yield *a, b', kPy38On),
+    ('x: T = 1, 2', kPy38On),
+    ('x: T = yield', kPy38On),
+    # 3.9: starred items after 'for ... in'; 3.11: starred subscripts.
+    ('for x in *a, *b: pass', kNewer),
+    ('x = a[*b, c]', kNewer[2:]),
+    ('return *a', kPy38On),  # as in CPython 3.8's grammar; its compiler rejects the lone star
 ]
 # Snippets whose `async`/`await` are keyword tokens: (text, versions).
 kAsyncSnippets = [
@@ -773,7 +807,7 @@ kAsyncSnippets = [
     ('ASYNC with a as b:', kPy3),
     ('x = AWAIT f() ** 2', kPy3),
     ('x = [i ASYNC for i in a]', kPy36),
-    ('x = [AWAIT i ASYNC for i in a if (j := i)]', ('3.8',)),
+    ('x = [AWAIT i ASYNC for i in a if (j := i)]', kPy38On),
     ('x = AWAIT', ()),
     ('ASYNC x = 1', ()),
     ('ASYNC class A:', ()),

@@ -49,6 +49,15 @@ def Analyze(version, source):
     return logicals, [r for r in results if r is not None]
 
 
+# 3.9 to 3.13 analyzers: unions, builtin generics, a starred annotation, type parameters.
+kCases312 = [
+    (b'x: int | None = None\n', [(b'x', b'int | None')], []),
+    (b'def f[T](x: T, *args: *Ts, **kw: list[int]) -> dict[str, T] | None: pass\n', [],
+     [(b'x', b'T'), (b'args', b'*Ts'), (b'kw', b'list[int]'), (b'return', b'dict[str, T] | None')]),
+    (b'class C[T: (int, str)]:\n    attr: tuple[T, *Ts]\n', [(b'attr', b'tuple[T, *Ts]')], []),
+]
+
+
 class ReportsCollected(object):
     """Mixin: a test fails when the analyzer reports an internal error while it runs."""
 
@@ -129,8 +138,8 @@ kCases38 = [
 class RecordsTest(ReportsCollected, unittest.TestCase):
 
     def testCases(self):
-        for versions, cases in ((('2.7', '3.6', '3.7', '3.8'), kCases), (('3.6', '3.7', '3.8'), kCases36),
-                                (('3.8',), kCases38)):
+        for versions, cases in ((('2.7', '3.6', '3.7', '3.8', '3.13'), kCases), (('3.6', '3.7', '3.8', '3.13'), kCases36),
+                                (('3.8', '3.9', '3.13'), kCases38), (('3.12', '3.13'), kCases312)):
             for version in versions:
                 for source, plain, args in cases:
                     logicals, failed = Analyze(version, source)

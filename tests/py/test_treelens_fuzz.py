@@ -25,7 +25,7 @@ kSeed = int(os.environ.get('TREELENS_FUZZ_SEED') or 20261206)
 kSpecial = [b'\\', b'$', b'?', b'...', b'async', b'await', b'@', b'->', b'else', b'except',
             b'finally', b'elif', b'try', b'def', b'class', b'lambda', b':', b'(', b')', b'[',
             b'{', b'}', b',', b'*', b'**', b'=', b'f"{x}"', b'# type: int', b'\n', b':=', b'/',
-            b'f"{x=!r:>{w}}"']
+            b'f"{x=!r:>{w}}"', b'match', b'case', b'_', b'type', b'|', b'with (', b'except*', b'[T]']
 
 
 def RandomFString(rnd, depth=0):
@@ -79,9 +79,13 @@ class FuzzTest(unittest.TestCase):
                      tl.CPGenAnalyzerImpl((2, 7, 0), tl.kPy2DefaultGrammar, None, False, syntax_checks=True),
                      tl.CPGenAnalyzerImpl((3, 6, 0), syntax_checks=True),
                      tl.CPGenAnalyzerImpl((3, 8, 0), 'Python-Grammar-3.8', syntax_checks=True)]
+        # The 3.9 to 3.13 grammars with their keyword lists, with and without the checks.
+        from pysource import analysis
+        analyzers += [analysis.GetAnalyzer(v, checks).Impl() for v in ('3.9', '3.10', '3.12', '3.13')
+                      for checks in (False, True)]
         lines, vocab = [], set(kSpecial)
         for path in (support.CorpusFiles('2.7', limit=25) + support.CorpusFiles('3.6', limit=25)
-                     + support.CorpusFiles('3.8', limit=25)):
+                     + support.CorpusFiles('3.8', limit=25) + support.CorpusFiles('3.13', limit=25)):
             for logical in utils.GetLogicalsFromText(support.ReadBytes(path)):
                 if logical.fKind != 22:
                     lines.append(logical.fLineText)

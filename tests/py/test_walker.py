@@ -197,6 +197,40 @@ class RecordsTest(unittest.TestCase):
             for source in (b'(n := 1)\n', b'def f(a, /): pass\n', b"s = f'{x=}'\n"):
                 self.assertIsInstance(Record(version, source)[0], SyntaxError, (version, source))
 
+    def testPython39To313(self):
+        called, tp = si.kCalledPrefix, si.kTypeParamPrefix
+        # Decorators of any form read their names; a dotted one is called with the function.
+        self.check('3.9', b'@buttons[0].clicked.connect\n', [],
+                   {b'buttons', b'buttons[0].clicked', b'buttons[0].clicked.connect'}, [])
+        self.check('3.9', b'@a.b\n', [], {b'a', b'a.b'}, [(b'a.b', called + b'()')])
+        self.check('3.9', b'@a.b(x)\n', [], {b'a', b'a.b', b'x'}, [(b'a.b', called + b'(x)')])
+        self.check('3.9', b'with (open(p) as f, g() as h,): pass\n', [b'f', b'h'], {b'open', b'p', b'g'})
+        self.check('3.9', b'for x in *a, *b: pass\n', [b'x'], {b'a', b'b'})
+        self.check('3.10', b'x[y := 1]\n', [b'y'], {b'x'})
+        # Patterns: captures, stars, mapping rests and as-names bind, `_` binds nothing;
+        # value and class patterns read their dotted names; the subject and guard are read.
+        self.check('3.10', b'match self.x, *y:\n', [], {b'self', b'self.x', b'y'})
+        self.check('3.10', b'case [a, *rest, _] if rest: pass\n', [b'a', b'rest'], {b'rest'})
+        self.check('3.10', b'case {"k": v, m.K: 1, **kw}: pass\n', [b'v', b'kw'], {b'm', b'm.K'})
+        self.check('3.10', b'case mod.Point(x=0, y=yy) | Other(yy): pass\n', set([b'yy']),
+                   {b'mod', b'mod.Point', b'Other'})
+        self.check('3.10', b'case (1 | -2 | 3+4j | "s" | None) as z: return z\n', [b'z'], {b'z'})
+        self.check('3.10', b'case _: pass\n', [], set(), [])
+        self.check('3.10', b'case *_, [*_]: pass\n', [], set(), [])
+        # Lines that only start with a soft keyword stay ordinary statements.
+        self.check('3.10', b'match = re.match(p, s)\n', [b'match'], {b're', b're.match', b'p', b's'})
+        self.check('3.10', b'case(x)\n', [], {b'case', b'x'})
+        self.check('3.12', b'type(x)\n', [], {b'type', b'x'})
+        self.check('3.11', b'except* (A, B) as e:\n', [b'e'], {b'A', b'B'})
+        self.check('3.11', b'def f(*args: *Ts): pass\n', args=[b'args'])
+        # Type parameters: (name, ':t:' + prefix), not names the line defines; bounds and defaults read.
+        self.check('3.12', b'def f[T: int, *Ts, **P](x: T) -> T: pass\n', [], {b'int', b'T'},
+                   [(b'T', tp), (b'Ts', tp + b'*'), (b'P', tp + b'**')], args=[b'x'])
+        self.check('3.12', b'class C[T](Base): pass\n', [], set(), [(b'T', tp)], bases=[b'Base'])
+        self.check('3.12', b'type X[T] = list[T] | Y\n', [b'X'], {b'list', b'T', b'Y'}, [(b'T', tp)])
+        self.check('3.13', b'def f[T = int, *Ts = *tuple[int]](): pass\n', [], {b'int', b'tuple'},
+                   [(b'T', tp), (b'Ts', tp + b'*')])
+
     def testAsync(self):
         self.check('3.6', b'x = await y\n', [b'x'], {b'y'}, in_async_def=True)
         self.check('3.6', b'async for a in b: pass\n', [b'a'], {b'b'}, in_async_def=True)

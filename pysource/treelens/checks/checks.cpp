@@ -3,6 +3,7 @@
 // the syntax tree, the symbol tables, the code) and reports the first error of
 // the earliest pass; each pass here keeps its first error in tree order.
 #include "pysource/treelens/checks/checks.h"
+#include "pysource/treelens/checks/newsyntax.h"
 
 #include "pysource/treelens/checks/fstrings.h"
 #include "pysource/treelens/host/host.h"
@@ -51,7 +52,6 @@ enum class Sym : uint8_t {
   YieldExpr,
   NamedExpr, // test ':=' test
   Sequence, // testlist, exprlist, testlist_star_expr, testlist_safe, testlist1
-  Subscriptlist,
   ExprStmt,
   AnnAssign,
   DelStmt,
@@ -82,6 +82,12 @@ enum class Sym : uint8_t {
   Decorated,
   SimpleStmt,
   Suite,
+  MatchStmt,
+  CaseBlock,
+  TypeParams,
+  TypeStmt,
+  Subscript,
+  SubscriptList,
 };
 
 struct SymName {
@@ -126,7 +132,6 @@ const SymName SymNames[] = {
     {"testlist_star_expr", Sym::Sequence},
     {"testlist_safe", Sym::Sequence},
     {"testlist1", Sym::Sequence},
-    {"subscriptlist", Sym::Subscriptlist},
     {"expr_stmt", Sym::ExprStmt},
     {"annassign", Sym::AnnAssign},
     {"del_stmt", Sym::DelStmt},
@@ -146,6 +151,13 @@ const SymName SymNames[] = {
     {"typedargslist", Sym::ArgsList},
     {"varargslist", Sym::ArgsList},
     {"tfpdef", Sym::ParamDef},
+    {"tfpdef_star", Sym::ParamDef},
+    {"match_stmt", Sym::MatchStmt},
+    {"case_block", Sym::CaseBlock},
+    {"type_params", Sym::TypeParams},
+    {"type_stmt", Sym::TypeStmt},
+    {"subscript", Sym::Subscript},
+    {"subscriptlist", Sym::SubscriptList},
     {"vfpdef", Sym::ParamDef},
     {"fpdef", Sym::ParamDef},
     {"fplist", Sym::FpList},
@@ -429,6 +441,10 @@ private:
   void futureImport(N *X, Py_ssize_t Names, bool Top);
   void namesStmt(N *X, const Scope &S, bool Nonlocal);
   void scopeStmt(N *X, const Scope &S, const char *Word);
+  void matchStmt(N *X, const Scope &S);
+  void typeParams(N *X, const Scope &S);
+  void typeStmt(N *X, const Scope &S);
+  ReportFn reporter();
 
   // Expressions.
   void load(N *X, const Scope &S);
@@ -582,7 +598,14 @@ void Checker::stmt(N *X, const Scope &S) {
     for (Py_ssize_t I = 0; I < count(X); ++I)
       stmt(child(X, I), S);
     return;
+  case Sym::MatchStmt:
+    return matchStmt(X, S);
+  case Sym::TypeStmt:
+    return typeStmt(X, S);
   case Sym::Decorator:
+    // '@' namedexpr_test NEWLINE (3.9 on)
+    if (count(X) == 3)
+      return load(child(X, 1), S);
     // '@' dotted_name ['(' [arglist] ')'] NEWLINE
     if (count(X) >= 5 && textIs(child(X, 2), "(") && !textIs(child(X, 3), ")"))
       call(child(X, 3), S);
@@ -615,6 +638,67 @@ void Checker::stmt(N *X, const Scope &S) {
     // An expression statement.
     return load(X, S);
   }
+}
+
+ReportFn Checker::reporter() {
+  return [this](bool Parse, N *At, const std::string &Msg) { report(Parse ? kParse : kCompile, At, Msg); };
+}
+
+/// MATCH subject ':' (NEWLINE | case_block): the subject is read; a lone
+/// starred subject is no tuple. A case clause's patterns are checked, its
+/// guard read and its body checked as statements.
+void Checker::matchStmt(N *X, const Scope &S) {
+  Py_ssize_t Colon = 1;
+  while (Colon < count(X) && !textIs(child(X, Colon), ":"))
+    ++Colon;
+  if (Colon == 2 && symOf(child(X, 1)) == Sym::StarExpr)
+    report(kParse, child(X, Colon), "invalid syntax");
+  for (Py_ssize_t I = 1; I < Colon; ++I) {
+    N *C = child(X, I);
+    if (symOf(C) == Sym::StarExpr)
+      load(child(C, 1), S);
+    else
+      load(C, S);
+  }
+  N *Case = child(X, count(X) - 1);
+  if (symOf(Case) != Sym::CaseBlock || count(Case) < 4)
+    return;
+  // CASE patterns [guard] ':' suite
+  checkPatterns(child(Case, 1), Minor, reporter());
+  for (Py_ssize_t I = 2; I < count(Case); ++I) {
+    N *C = child(Case, I);
+    if (textIs(C, ":")) {
+      if (I + 1 < count(Case))
+        stmt(child(Case, I + 1), S);
+      return;
+    }
+    load(C, S);
+  }
+}
+
+/// A type parameter list: its names, bounds and defaults.
+void Checker::typeParams(N *X, const Scope &S) {
+  checkTypeParams(X, Minor, reporter());
+  for (Py_ssize_t I = 1; I + 1 < count(X); I += 2) {
+    N *P = child(X, I);
+    for (Py_ssize_t J = 1; J < count(P); ++J) {
+      N *C = child(P, J);
+      if (symOf(C) == Sym::StarExpr)
+        load(child(C, 1), S);
+      else if (!isLeaf(C) || symOf(C) == Sym::Name)
+        load(C, S);
+    }
+  }
+}
+
+/// TYPE NAME [type_params] '=' test
+void Checker::typeStmt(N *X, const Scope &S) {
+  if (count(X) < 4)
+    return;
+  storeName(child(X, 1), child(X, 1), false);
+  if (symOf(child(X, 2)) == Sym::TypeParams)
+    typeParams(child(X, 2), S);
+  load(child(X, count(X) - 1), S);
 }
 
 /// return, break and continue: the block they need.
@@ -738,11 +822,12 @@ void Checker::tryStmt(N *X, const Scope &S) {
     N *Body = child(X, I + 2);
     Scope BS = S;
     if (symOf(C) == Sym::ExceptClause) {
-      // 'except' [test [('as' | ',') test]]
-      if (count(C) >= 2)
-        load(child(C, 1), S);
-      if (count(C) >= 4) {
-        N *T = child(C, 3);
+      // 'except' ['*'] [test [('as' | ',') test]]
+      Py_ssize_t Star = textIs(child(C, 1), "*") ? 1 : 0;
+      if (count(C) >= 2 + Star)
+        load(child(C, 1 + Star), S);
+      if (count(C) >= 4 + Star) {
+        N *T = child(C, 3 + Star);
         if (Py3)
           storeName(T, T, false);
         else
@@ -781,9 +866,12 @@ void Checker::funcdef(N *X, const Scope &S, bool Async, N *At) {
     return;
   storeName(child(X, 1), child(X, 1), false);
   std::vector<std::string> Names;
-  N *Params = child(X, 2);
+  Py_ssize_t Shift = symOf(child(X, 2)) == Sym::TypeParams ? 1 : 0;
+  if (Shift)
+    typeParams(child(X, 2), S);
+  N *Params = child(X, 2 + Shift);
   parameters(Params, S, Names, At);
-  Py_ssize_t I = 3;
+  Py_ssize_t I = 3 + Shift;
   if (textIs(child(X, I), "->")) {
     load(child(X, I + 1), S);
     I += 2;
@@ -801,12 +889,14 @@ void Checker::classdef(N *X, const Scope &S) {
     return;
   storeName(child(X, 1), child(X, 3), false);
   Py_ssize_t I = 2;
-  if (textIs(child(X, 2), "(")) {
-    if (!textIs(child(X, 3), ")")) {
+  if (symOf(child(X, 2)) == Sym::TypeParams)
+    typeParams(child(X, I++), S);
+  if (textIs(child(X, I), "(")) {
+    if (!textIs(child(X, I + 1), ")")) {
       if (Py3)
-        call(child(X, 3), S);
+        call(child(X, I + 1), S);
       else
-        load(child(X, 3), S);
+        load(child(X, I + 1), S);
     }
     while (I < count(X) && !textIs(child(X, I), ":"))
       ++I;
@@ -964,19 +1054,27 @@ void Checker::load(N *X, const Scope &S) {
     return load(child(X, 1), S);
   case Sym::Sequence:
     return elements(X, S, count(X) > 1);
-  case Sym::Subscriptlist: {
-    // A tuple index, which may unpack items, unless an item is a slice.
+  case Sym::SubscriptList: {
+    // A tuple index may unpack items: parenthesized ones before 3.11, unless
+    // an item is a slice; any from 3.11 on.
     bool Slices = false;
     for (Py_ssize_t I = 0; I < count(X); ++I) {
       N *C = child(X, I);
       if (textIs(C, ":"))
         Slices = true;
-      else if (!isLeaf(C) && symOf(C) == Sym::Other)
+      else if (!isLeaf(C) && (symOf(C) == Sym::Subscript || symOf(C) == Sym::Other))
         for (Py_ssize_t J = 0; J < count(C); ++J)
           Slices = Slices || textIs(child(C, J), ":");
     }
-    return elements(X, S, !Slices);
+    return elements(X, S, Minor >= 11 || !Slices);
   }
+  case Sym::Subscript:
+    // namedexpr_test [':' ...]: an assignment expression cannot start a slice.
+    if (count(X) > 1 && symOf(child(X, 0)) == Sym::NamedExpr && textIs(child(X, 1), ":"))
+      report(kParse, child(X, 1), "invalid syntax");
+    for (Py_ssize_t I = 0; I < count(X); ++I)
+      load(child(X, I), S);
+    return;
   default:
     for (Py_ssize_t I = 0; I < count(X); ++I)
       load(child(X, I), S);
@@ -1023,6 +1121,9 @@ void Checker::atom(N *X, const Scope &S) {
   bool Paren = textIs(Open, "(");
   if (InS == Sym::TestlistComp || InS == Sym::DictOrSetMaker) {
     Py_ssize_t Count = count(In);
+    // A set display's first item may be an assignment expression (3.9), a dictionary key not.
+    if (InS == Sym::DictOrSetMaker && symOf(child(In, 0)) == Sym::NamedExpr && textIs(child(In, 1), ":"))
+      report(kParse, child(In, 1), "invalid syntax");
     N *Last = child(In, Count - 1);
     Sym LastS = symOf(Last);
     if (LastS == Sym::CompFor || LastS == Sym::SyncCompFor) {
@@ -1074,7 +1175,10 @@ void Checker::atomExpr(N *X, const Scope &S) {
         if (count(C) == 3)
           call(child(C, 1), S);
       } else if (textIs(child(C, 0), "[")) {
-        load(child(C, 1), S);
+        if (symOf(child(C, 1)) == Sym::StarExpr && Minor >= 11)
+          load(child(child(C, 1), 1), S);
+        else
+          load(child(C, 1), S);
       }
     } else {
       load(C, S);
@@ -1774,8 +1878,11 @@ void Checker::parameters(N *X, const Scope &S, std::vector<std::string> &Names, 
         N *P = Items[I + 1];
         N *NameLeaf = isLeaf(P) ? P : child(P, 0);
         storeName(NameLeaf, NameLeaf, false);
-        if (!isLeaf(P) && count(P) == 3)
-          load(child(P, 2), S);
+        if (!isLeaf(P) && count(P) == 3) {
+          // `*args: *Ts` (3.11): the grammar admits a starred annotation only here.
+          N *Ann = child(P, 2);
+          load(symOf(Ann) == Sym::StarExpr ? child(Ann, 1) : Ann, S);
+        }
         paramNames(P, Names);
         ++I;
       }

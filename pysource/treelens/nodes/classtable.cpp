@@ -24,7 +24,7 @@ const char *const BinaryExpressionRules[] = {
     nullptr};
 const char *const StarExpressionRules[] = {"star_expr: '*' expr", nullptr};
 const char *const FunctionParameterDefRules[] = {"fpdef: NAME | '(' fplist ')'", "tfpdef: NAME [':' test]",
-                                                 nullptr};
+                                                 "tfpdef_star: NAME [':' (test | star_expr)]", nullptr};
 const char *const DefiningArglistRules[] = {"fplist: fpdef (',' fpdef)* [',']", nullptr};
 const char *const SingleDecoratorRules[] = {"decorator: '@' dotted_name [ '(' [arglist] ')' ] NEWLINE",
                                             nullptr};
@@ -46,6 +46,24 @@ const char *const TestListStarExprRules[] = {
 const char *const ListmakerRules[] = {"listmaker: test ( list_for | (',' test)* [','] )", nullptr};
 const char *const AtomExprRules[] = {"atom_expr: [AWAIT] atom trailer*", nullptr};
 const char *const NamedExprRules[] = {"namedexpr_test: test [':=' test]", nullptr};
+const char *const CaseBlockRules[] = {"case_block: CASE patterns [guard] ':' suite", nullptr};
+const char *const PatternRules[] = {
+    "patterns: (pattern | star_pattern) (',' (pattern | star_pattern))* [',']",
+    "pattern: or_pattern ['as' NAME]",
+    "or_pattern: closed_pattern ('|' closed_pattern)*",
+    "literal_pattern: signed_number [('+' | '-') NUMBER] | STRING+ | 'None' | 'True' | 'False'",
+    "signed_number: ['-'] NUMBER",
+    "name_pattern: NAME ('.' NAME)* ['(' [class_arg (',' class_arg)* [',']] ')']",
+    "class_arg: pattern ['=' pattern]",
+    "group_pattern: '(' [(pattern | star_pattern) (',' (pattern | star_pattern))* [',']] ')'",
+    "sequence_pattern: '[' [(pattern | star_pattern) (',' (pattern | star_pattern))* [',']] ']'",
+    "star_pattern: '*' NAME",
+    "mapping_pattern: '{' [mapping_item (',' mapping_item)* [',']] '}'",
+    "mapping_item: (literal_pattern | value_name) ':' pattern | '**' NAME",
+    "value_name: NAME '.' NAME ('.' NAME)*",
+    nullptr};
+const char *const TypeParamsRules[] = {"type_params: '[' type_param (',' type_param)* [','] ']'", nullptr};
+const char *const TypeAliasRules[] = {"type_stmt: TYPE NAME [type_params] '=' test", nullptr};
 const char *const PowerRules[] = {"power: atom trailer* ['**' factor]", "power: atom_expr ['**' factor]",
                                   nullptr};
 
@@ -139,6 +157,16 @@ const std::vector<NodeClassRow> &nodeClassRows() {
       TL_NODE_OPS(CFactorExpr, CExpression, "Unary '+', '-' or '~' applied to a factor.", nullptr, false,
                   exprClass),
       TL_NODE(CNamedExpr, CExpression, "Assignment expression: NAME ':=' test.", NamedExprRules, false),
+      TL_NODE(CCaseBlock, CNode, "case clause of a match statement: 'case' patterns [guard] ':' suite.",
+              CaseBlockRules, false),
+      TL_NODE(CPattern, CNode,
+              "A pattern of a case clause other than a lone capture (a NAME): or-, as-, literal, value, "
+              "class, group, sequence, star and mapping patterns and their parts.",
+              PatternRules, false),
+      TL_NODE(CTypeParams, CNode, "Type parameter list of a def or class: '[' type_param, ... ']'.",
+              TypeParamsRules, false),
+      TL_NODE(CTypeAliasStmt, CStmt, "type statement: 'type' NAME [type_params] '=' test.", TypeAliasRules,
+              false),
   };
   return Rows;
 }

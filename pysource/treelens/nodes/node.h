@@ -104,6 +104,10 @@ enum class NodeClass : int {
   CStringLiteral,
   CFactorExpr,
   CNamedExpr,
+  CCaseBlock,
+  CPattern,
+  CTypeParams,
+  CTypeAliasStmt,
   Count
 };
 

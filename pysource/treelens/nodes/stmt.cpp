@@ -74,14 +74,20 @@ const char *const AugAssignOps[] = {"+=", "-=", "*=", "/=", "%=", "&=", "|=", "^
 
 // ---- CFuncdefStmt ----
 
-// funcdef: 'def' NAME parameters ['->' test] ':' suite
+/// 1 when child 2 of a def or class is a type parameter list (3.12), else 0.
+Py_ssize_t typeParamsShift(NodeObject *N) {
+  return rawCount(N) > 2 && isNodeOf(obj(childAt(N, 2)), C::CTypeParams) ? 1 : 0;
+}
+
+// funcdef: 'def' NAME [type_params] parameters ['->' test] ':' suite
 Ref FuncdefOps::getName(NodeObject *N) const { return textOf(childAt(N, 1)); }
 
-Ref FuncdefOps::getParameters(NodeObject *N) const { return child(N, 2); }
+Ref FuncdefOps::getParameters(NodeObject *N) const { return child(N, 2 + typeParamsShift(N)); }
 
 Ref FuncdefOps::getReturnType(NodeObject *N) const {
-  if (childTextIs(N, 3, "->"))
-    return child(N, 4);
+  Py_ssize_t S = typeParamsShift(N);
+  if (childTextIs(N, 3 + S, "->"))
+    return child(N, 4 + S);
   return none();
 }
 
@@ -89,11 +95,12 @@ Ref FuncdefOps::getSuite(NodeObject *N) const { return child(N, -1); }
 
 // ---- CClassdefStmt ----
 
-// classdef: 'class' NAME ['(' [arglist] ')'] ':' suite
+// classdef: 'class' NAME [type_params] ['(' [arglist] ')'] ':' suite
 Ref ClassdefOps::getBaseClassList(NodeObject *N) const {
-  if (nodeGetChildCount(N) < 4 || !leafIs(childAt(N, 2), "(") || leafIs(childAt(N, 3), ")"))
+  Py_ssize_t S = typeParamsShift(N);
+  if (nodeGetChildCount(N) < 4 + S || !leafIs(childAt(N, 2 + S), "(") || leafIs(childAt(N, 3 + S), ")"))
     return newList();
-  Ref Args = child(N, 3);
+  Ref Args = child(N, 3 + S);
   return getUsedArgInfoList(Args.get());
 }
 
@@ -145,8 +152,10 @@ Ref WithItemOps::getTarget(NodeObject *N) const { return child(N, 2); }
 
 // ---- CExceptClause ----
 
-// except_clause: 'except' [test [('as' | ',') test]]
-Ref ExceptClauseOps::getExceptionType(NodeObject *N) const { return nodeGetChild(N, 1); }
+// except_clause: 'except' ['*'] [test [('as' | ',') test]]
+Ref ExceptClauseOps::getExceptionType(NodeObject *N) const {
+  return nodeGetChild(N, rawCount(N) > 2 && leafIs(childAt(N, 1), "*") ? 2 : 1);
+}
 
 Ref ExceptClauseOps::getTarget(NodeObject *N) const {
   Py_ssize_t Count = nodeGetChildCount(N);

@@ -20,6 +20,12 @@ enum TokenCode : int {
   kAwait = 53,
   kAsync = 54,
   kColonEqual = 55,
+  // The soft keywords as the parser retypes them, and the '(' that opens
+  // parenthesized with items; no text has these types.
+  kMatch = 60,
+  kCase = 61,
+  kType = 62,
+  kWithLpar = 63,
   kComment = 202,
   kBackslash = 203,
 };
@@ -90,7 +96,13 @@ struct ParserObject {
   // Bound engine methods, used when the engine publishes no native API.
   PyObject *SetupMethod, *AddTokenMethod, *GetRootNodeMethod;
   bool Busy; ///< a parse is in progress: no re-entry, no re-initialisation
+  /// Which retyped tokens the grammar has (kHas* bits), read from the grammar
+  /// on first use; 0 until then.
+  int Retyped;
 };
+
+/// Bits of ParserObject::Retyped.
+enum : int { kRetypedKnown = 1, kHasMatch = 2, kHasType = 4, kHasWithLpar = 8 };
 
 TL_HIDDEN PyTypeObject &parserType();
 /// Readies CPGenParserImpl (after CPGenAnalyzer) and adds it to the module.

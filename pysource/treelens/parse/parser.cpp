@@ -28,6 +28,12 @@ void requireIdle(PyObject *O) {
     tl::raise(PyExc_RuntimeError, kBusyMessage);
 }
 
+/// Before __setstate__: idle, and the grammar's retyped tokens read again.
+void beforeSetState(PyObject *O) {
+  requireIdle(O);
+  self(O)->Retyped = 0;
+}
+
 /// A token the parser feeds of its own accord, with its type as the host classifies it.
 struct SynthToken {
   PyObject *Text;
@@ -37,6 +43,8 @@ struct SynthToken {
 struct SynthTokens {
   SynthToken If, Zero, Colon, Equal, Pass, Newline, Try, Finally, Def, Function, LPar, RPar, Dot;
   PyObject *Elif, *Except, *Else, *Async, *Await, *InvalidSyntax;
+  PyObject *With, *As, *Type;
+  SynthToken Match, Case;
 };
 SynthTokens Synth;
 
@@ -186,12 +194,28 @@ public:
   /// Borrowed text of the first token after I that is no comment or
   /// backslash, or nullptr.
   PyObject *nextKept(Py_ssize_t I) const {
+    Py_ssize_t J = nextKeptIndex(I);
+    return J < Count ? Toks[J].Text : nullptr;
+  }
+
+  /// Index of the first token after I that is no comment or backslash, or count().
+  Py_ssize_t nextKeptIndex(Py_ssize_t I) const {
     for (Py_ssize_t J = I + 1; J < Count; ++J) {
       PyObject *T = Toks[J].Text;
       if (PyString_GET_SIZE(T) == 0 || (PyString_AS_STRING(T)[0] != '\\' && PyString_AS_STRING(T)[0] != '#'))
-        return T;
+        return J;
     }
-    return nullptr;
+    return Count;
+  }
+
+  /// Index of the last token that is no comment or backslash, or -1.
+  Py_ssize_t lastKeptIndex() const {
+    for (Py_ssize_t J = Count - 1; J >= 0; --J) {
+      PyObject *T = Toks[J].Text;
+      if (PyString_GET_SIZE(T) == 0 || (PyString_AS_STRING(T)[0] != '\\' && PyString_AS_STRING(T)[0] != '#'))
+        return J;
+    }
+    return -1;
   }
 
 private:
@@ -299,10 +323,52 @@ void addSplitColonEqual(ParserObject *P, Py_ssize_t TokI, PyObject *Context) {
   }
 }
 
-Ref parseTokens(ParserObject *P, const TokenSnapshot &S, bool AsyncKw) {
+/// The kHas* bits of the parser's grammar, read once.
+int retypedTokens(ParserObject *P) {
+  if (!(P->Retyped & kRetypedKnown)) {
+    int Bits = kRetypedKnown;
+    if (P->Py3Grammar) {
+      Bits |= grammarHasToken(P, kMatch) ? kHasMatch : 0;
+      Bits |= grammarHasToken(P, kType) ? kHasType : 0;
+      Bits |= grammarHasToken(P, kWithLpar) ? kHasWithLpar : 0;
+    }
+    P->Retyped = Bits;
+  }
+  return P->Retyped;
+}
+
+/// Whether the '(' at Open, right after `with`, holds parenthesized with items:
+/// its ')' is followed by the header's ':' and it holds a top-level ',' or `as`.
+/// `with (a, b) as c:` and `with (a):` keep the '(' of an expression.
+bool opensWithItems(const TokenSnapshot &S, Py_ssize_t Open) {
+  int Depth = 0;
+  bool Items = false;
+  for (Py_ssize_t J = Open; J < S.count(); ++J) {
+    int T = S[J].Type;
+    if (T == 7 || T == 9 || T == 26) {
+      ++Depth;
+    } else if (T == 8 || T == 10 || T == 27) {
+      if (--Depth == 0) {
+        Py_ssize_t Next = S.nextKeptIndex(J);
+        return Items && Next < S.count() && S[Next].Type == kColon;
+      }
+    } else if (Depth == 1 && (T == 12 || (T == kName && textIs(S[J].Text, Synth.As)))) {
+      Items = true;
+    }
+  }
+  return false;
+}
+
+/// How the first token of a line is read where the grammar has soft keywords.
+enum class SoftHead { None, Keyword, Name };
+
+Ref parseTokens(ParserObject *P, const TokenSnapshot &S, bool AsyncKw, SoftHead Soft = SoftHead::None) {
   engineSetup(P, P->FileInputNumber);
+  const int Retyped = retypedTokens(P);
   bool First = true, Decorator = false;
   int LastType = -1;
+  Py_ssize_t WithLpar = -1;
+  bool MatchHeader = false; ///< a match statement's header: its block follows on later lines
   Py_ssize_t Count = S.count();
   for (Py_ssize_t I = 0; I < Count; ++I) {
     PyObject *Tok = S[I].Text;
@@ -316,6 +382,15 @@ Ref parseTokens(ParserObject *P, const TokenSnapshot &S, bool AsyncKw) {
         addSynth(P, {&Synth.Try, &Synth.Colon, &Synth.Pass, &Synth.Newline}, Context.get());
       } else if (textIs(Tok, Synth.Else)) {
         addSynth(P, {&Synth.If, &Synth.Zero, &Synth.Colon, &Synth.Pass, &Synth.Newline}, Context.get());
+      } else if (Soft == SoftHead::Keyword) {
+        // match and case as keywords; a lone case clause gets a `match 0:` head.
+        if (textIs(Tok, Synth.Case.Text)) {
+          addSynth(P, {&Synth.Match, &Synth.Zero, &Synth.Colon}, Context.get());
+          TokType = kCase;
+        } else {
+          TokType = kMatch;
+          MatchHeader = true;
+        }
       } else if (!AsyncKw && textIs(Tok, Synth.Async)) {
         // An async def: as in the language's own tokenizer, async and await
         // are keywords from here on, so a body on the same line may await.
@@ -333,6 +408,21 @@ Ref parseTokens(ParserObject *P, const TokenSnapshot &S, bool AsyncKw) {
         TokType = kAsync;
       else if (textIs(Tok, Synth.Await))
         TokType = kAwait;
+    }
+    if (Retyped > kRetypedKnown && TokType == kName) {
+      if ((Retyped & kHasType) && textIs(Tok, Synth.Type)) {
+        // `type` followed by a name that is no keyword starts a type statement:
+        // two adjacent names are nothing else.
+        Py_ssize_t Next = S.nextKeptIndex(I);
+        if (Next < Count && S[Next].Type == kName && !PyDict_GetItem(P->Keywords, S[Next].Text))
+          TokType = kType;
+      } else if ((Retyped & kHasWithLpar) && textIs(Tok, Synth.With)) {
+        Py_ssize_t Next = S.nextKeptIndex(I);
+        if (Next < Count && S[Next].Type == 7 && opensWithItems(S, Next))
+          WithLpar = Next;
+      }
+    } else if (I == WithLpar) {
+      TokType = kWithLpar;
     }
     if (TokType == kComment)
       continue;
@@ -363,12 +453,85 @@ Ref parseTokens(ParserObject *P, const TokenSnapshot &S, bool AsyncKw) {
              {&Synth.Newline, &Synth.Def, &Synth.Function, &Synth.LPar, &Synth.RPar, &Synth.Colon,
               &Synth.Pass},
              End.get());
-  } else if (LastType == kColon) {
+  } else if (LastType == kColon && !MatchHeader) {
     engineAddToken(P, kName, Synth.Pass.Text, End.get());
   }
   engineAddToken(P, kNewline, Synth.Newline.Text, End.get());
   engineAddToken(P, kEndMarker, Py_None, End.get());
   return takeStatement(P, engineRoot(P), Decorator);
+}
+
+/// The token index of a pending ParseError (its context), or -1.
+Py_ssize_t pendingParseErrorIndex() {
+  PyObject *Type, *Value, *Tb;
+  PyErr_Fetch(&Type, &Value, &Tb);
+  PyErr_NormalizeException(&Type, &Value, &Tb);
+  Py_ssize_t I = -1;
+  if (Value) {
+    PyObject *Context = PyObject_GetAttrString(Value, "context");
+    if (Context && PyInt_Check(Context))
+      I = PyInt_AsSsize_t(Context);
+    Py_XDECREF(Context);
+  }
+  PyErr_Clear();
+  PyErr_Restore(Type, Value, Tb);
+  return I;
+}
+
+/// Whether a line that starts with the name `match` or `case` may be a match
+/// statement or case clause: a `match` line ends with ':', and neither is
+/// followed by '=', '.' or an operator that only continues an expression.
+bool mayBeSoftKeywordLine(ParserObject *P, const TokenSnapshot &S) {
+  if (!(retypedTokens(P) & kHasMatch) || S.count() < 2 || S[0].Type != kName)
+    return false;
+  bool IsMatch = textIs(S[0].Text, Synth.Match.Text);
+  if (!IsMatch && !textIs(S[0].Text, Synth.Case.Text))
+    return false;
+  Py_ssize_t Next = S.nextKeptIndex(0);
+  if (Next >= S.count())
+    return false;
+  int T = S[Next].Type;
+  // Tokens that cannot start a subject or pattern: '=', '.', ':', ')', ']',
+  // '}', ',', ';' and the augmented assignments.
+  if (T == 22 || T == 23 || T == kColon || T == 8 || T == 10 || T == 27 || T == 12 || T == 13 ||
+      (T >= 37 && T <= 47) || T == 49 || T == kColonEqual)
+    return false;
+  if (IsMatch) {
+    Py_ssize_t Last = S.lastKeptIndex();
+    return Last > 0 && S[Last].Type == kColon;
+  }
+  return true;
+}
+
+/// parseTokens for a line that may start with a soft keyword: read as a match
+/// statement or case clause first, and as an ordinary statement when that
+/// fails (`match(x)`, `case = 1`). When both fail, the error further right
+/// is raised (the reading that went further), the ordinary one on a tie.
+Ref parseLine(ParserObject *P, const TokenSnapshot &S, bool AsyncKw) {
+  if (!mayBeSoftKeywordLine(P, S))
+    return parseTokens(P, S, AsyncKw);
+  PyObject *Type, *Value, *Tb;
+  Py_ssize_t KeywordAt;
+  try {
+    return parseTokens(P, S, AsyncKw, SoftHead::Keyword);
+  } catch (const tl::PyErrSet &) {
+    if (!PyErr_ExceptionMatches(Host.ParseError))
+      throw;
+    KeywordAt = pendingParseErrorIndex();
+    PyErr_Fetch(&Type, &Value, &Tb);
+  }
+  Ref Held[] = {Ref::steal(Type), Ref::steal(Value), Ref::steal(Tb)};
+  try {
+    return parseTokens(P, S, AsyncKw, SoftHead::Name);
+  } catch (const tl::PyErrSet &) {
+    if (!PyErr_ExceptionMatches(Host.ParseError))
+      throw;
+    if (KeywordAt > pendingParseErrorIndex()) {
+      PyErr_Clear();
+      PyErr_Restore(Held[0].release(), Held[1].release(), Held[2].release());
+    }
+    throw;
+  }
 }
 
 /// The converter callback the engine calls for every token and reduced rule.
@@ -478,7 +641,9 @@ int parser_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
 
     Ref TokNumber2Name = tl::require(PyDict_Copy(Host.TokName));
     for (auto Entry : {std::make_pair(51, "RARROW"), std::make_pair(54, "ASYNC"), std::make_pair(53, "AWAIT"),
-                       std::make_pair(55, "COLONEQUAL"), std::make_pair(56, "ATEQUAL")}) {
+                       std::make_pair(55, "COLONEQUAL"), std::make_pair(56, "ATEQUAL"),
+                       std::make_pair(int(kMatch), "MATCH"), std::make_pair(int(kCase), "CASE"),
+                       std::make_pair(int(kType), "TYPE"), std::make_pair(int(kWithLpar), "WITH_LPAR")}) {
       Ref K = tl::require(PyInt_FromLong(Entry.first));
       Ref V = tl::require(PyString_FromString(Entry.second));
       tl::requireStatus(PyDict_SetItem(TokNumber2Name.get(), K.get(), V.get()));
@@ -495,6 +660,7 @@ int parser_init(PyObject *Self, PyObject *Args, PyObject *Kwds) {
     Ref Generator = tl::require(PyObject_Call(Host.ParserGenerator, GenArgs.get(), GenKwds.get()));
     Ref Gram = tl::require(PyObject_CallMethod(Generator.get(), const_cast<char *>("make_grammar"), nullptr));
     Py_XSETREF(P->Grammar, Gram.release());
+    P->Retyped = 0;
 
     P->Py3Grammar = tl::requireStatus(PyObject_IsTrue(Py3Grammar)) != 0;
     Py_INCREF(VersionTriple);
@@ -734,7 +900,7 @@ Ref parseToNode(ParserObject *P, PyObject *Logical, bool InAsyncDef) {
   S.readLogical(L);
   Py_INCREF(Logical);
   Py_XSETREF(P->Logical, Logical);
-  return parseTokens(P, S, P->AsyncAlwaysKeyword || InAsyncDef);
+  return parseLine(P, S, P->AsyncAlwaysKeyword || InAsyncDef);
 }
 
 Ref parseTokenListToNode(ParserObject *P, PyObject *TokList, bool InAsyncDef) {
@@ -744,7 +910,7 @@ Ref parseTokenListToNode(ParserObject *P, PyObject *TokList, bool InAsyncDef) {
   TokenSnapshot S;
   S.readList(TokList);
   Py_CLEAR(P->Logical);
-  return parseTokens(P, S, InAsyncDef);
+  return parseLine(P, S, InAsyncDef);
 }
 
 int initParserType(PyObject *Module) {
@@ -768,6 +934,11 @@ int initParserType(PyObject *Module) {
     Synth.Async = tl::internName("async");
     Synth.Await = tl::internName("await");
     Synth.InvalidSyntax = tl::internName("invalid syntax");
+    Synth.With = tl::internName("with");
+    Synth.As = tl::internName("as");
+    Synth.Type = tl::internName("type");
+    Synth.Match = SynthToken{tl::internName("match"), kMatch};
+    Synth.Case = SynthToken{tl::internName("case"), kCase};
 
     tl::TypeDesc D;
     D.Name = "pysource.treelens.CPGenParserImpl";
@@ -799,7 +970,7 @@ int initParserType(PyObject *Module) {
                         {"__CLogicalLine", F::Object, offsetof(ParserObject, CLogicalLine)},
                         {"_fVersionTriple", F::Object, offsetof(ParserObject, VersionTriple), &PyTuple_Type},
                         {"_fAsyncAlwaysKeyword", F::Bool, offsetof(ParserObject, AsyncAlwaysKeyword)}},
-                       Host.UnpickleFields, requireIdle);
+                       Host.UnpickleFields, beforeSetState);
     return 0;
   });
 }

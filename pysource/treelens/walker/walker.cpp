@@ -61,6 +61,10 @@ enum Row : unsigned char {
   RowYield,
   RowNamedExpr,
   RowUsedArgument,
+  RowCaseBlock,
+  RowPattern,
+  RowTypeParams,
+  RowTypeAlias,
   RowOther
 };
 
@@ -69,7 +73,8 @@ const C RowClasses[RowOther] = {C::CWithItem,   C::CImportNamesStmt, C::CFromImp
                                 C::CLambdaExpr, C::CGlobalStmt,      C::CNonlocalStmt,   C::CPower,
                                 C::CAtomExpr,   C::CNameLiteral,     C::CCompForNode,    C::CSingleDecorator,
                                 C::CDottedName, C::CExceptClause,    C::CYieldExpr,      C::CNamedExpr,
-                                C::CSingleUsedArgumentNode};
+                                C::CSingleUsedArgumentNode, C::CCaseBlock, C::CPattern, C::CTypeParams,
+                                C::CTypeAliasStmt};
 
 /// The row of each native node class, so that a node of a native class costs
 /// one table read; instances of Python subclasses take the class tests.
@@ -125,6 +130,10 @@ void dispatch(NW *W, PyObject *Node) {
   case RowYield: return visitYield(W, Node);
   case RowNamedExpr: return visitNamedExpr(W, Node);
   case RowUsedArgument: return visitUsedArgument(W, Node);
+  case RowCaseBlock: return visitCaseBlock(W, Node);
+  case RowPattern: return visitPattern(W, Node);
+  case RowTypeParams: return visitTypeParams(W, Node);
+  case RowTypeAlias: return visitTypeAlias(W, Node);
   case RowOther: return visitChildren(W, Node);
   }
 }

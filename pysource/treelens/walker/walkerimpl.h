@@ -79,6 +79,14 @@ TL_HIDDEN void visitClassdef(NW *W, PyObject *Node);
 TL_HIDDEN void visitExceptClause(NW *W, PyObject *Node);
 TL_HIDDEN void addNodeInfoStr(NW *W, PyObject *NameNode, PyObject *IStr);
 
+// ---- Case clauses, patterns, type parameters (newsyntax.cpp) ----
+TL_HIDDEN void visitCaseBlock(NW *W, PyObject *Node);
+TL_HIDDEN void visitPattern(NW *W, PyObject *Node);
+TL_HIDDEN void visitTypeParams(NW *W, PyObject *Node);
+/// The type parameter list of a def or class node, when it has one.
+TL_HIDDEN void visitTypeParamsOf(NW *W, PyObject *Node);
+TL_HIDDEN void visitTypeAlias(NW *W, PyObject *Node);
+
 // ---- Calls and type equivalences ----
 TL_HIDDEN void visitPower(NW *W, PyObject *Node);
 TL_HIDDEN void visitAtomExpr(NW *W, PyObject *Node);
