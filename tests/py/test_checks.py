@@ -187,7 +187,7 @@ kPlacedElsewhere = ('def f():\n    from os import *\n', 'async def f():\n    def
 
 # Tokens the lexer must tell apart for the grammar: (source, versions that accept it);
 # the others say 'invalid syntax'.
-kPy3Versions = ('3.5', '3.6', '3.7', '3.8')
+kPy3Versions = ('3.5', '3.6', '3.7', '3.8', '3.9', '3.10', '3.11', '3.12', '3.13')
 kTokenCases = [
     ('x -> y', ()),
     ('lambda: x -> y', ()),

@@ -66,7 +66,7 @@ class CliTest(unittest.TestCase):
         bad = self.Write('bad.py', b'x = 1\nif x\n')
         status, out, err = Treelens(good)
         self.assertEqual(status, 0, err)
-        self.assertEqual(out, good + b': version 3.8\n' + good + b':1: [stmt] import os\n    defines: os\n    equivs: os = '
+        self.assertEqual(out, good + b': version 3.13\n' + good + b':1: [stmt] import os\n    defines: os\n    equivs: os = '
                          b':i:os\n' + good + b':3: [stmt] x = y\n    defines: x\n    reads: y\n'
                          b'    equivs: x = y\n')
         self.assertEqual(err, b'1 files, 3 logical lines, 0 syntax errors, %s seconds\n'
@@ -179,14 +179,14 @@ class CliTest(unittest.TestCase):
         cases = [('jsonl', False, [
                      {'path': paths[0], 'version': None, 'status': 'unreadable',
                       'problem': 'not Python source: NUL byte at line 1, column 1'},
-                     {'path': paths[1], 'version': '3.8', 'status': 'ok', 'problem': None},
+                     {'path': paths[1], 'version': '3.13', 'status': 'ok', 'problem': None},
                      (paths[2], 1, None), (paths[2], 2, (13, 15)),
                      (paths[3], 1, None), (paths[3], 2, None), (paths[3], 3, (6, 6))]),
                  ('jsonl', True, [{'path': paths[0], 'version': None, 'status': 'unreadable',
                                    'problem': 'not Python source: NUL byte at line 1, column 1'},
                                   (paths[2], 2, (13, 15)), (paths[3], 3, (6, 6))]),
                  ('text', True, [escaped[2] + b':2:13: invalid syntax', escaped[3] + b':3:6: invalid syntax']),
-                 ('text', False, [escaped[1] + b': version 3.8', escaped[2] + b': version 3.8',
+                 ('text', False, [escaped[1] + b': version 3.13', escaped[2] + b': version 3.13',
                                   escaped[2] + b':1: [stmt] x = 1', b'    defines: x',
                                   b'    equivs: x = :l:int: 1',
                                   escaped[2] + b':2: [stmt] s = "\xc3\xa9\xc3\xa9" +  = 2',

@@ -1978,7 +1978,7 @@ bool Checker::fstring(N *Tok, N *At, const Scope &S) {
   if (!Tok->Text || !PyString_Check(Tok->Text))
     return true;
   FieldScan Scan;
-  scanFString(PyString_AS_STRING(Tok->Text), PyString_GET_SIZE(Tok->Text), Py38, Scan);
+  scanFString(PyString_AS_STRING(Tok->Text), PyString_GET_SIZE(Tok->Text), Py38, Py3 && Minor >= 12, Scan);
   std::size_t Checked = Scan.Failed ? Scan.ErrorAfter : Scan.Exprs.size();
   for (std::size_t I = 0; I < Checked && !First[kParse].Set && !First[kAst].Set; ++I)
     fieldExpression(Tok, Scan.Exprs[I].Begin, Scan.Exprs[I].End, S);

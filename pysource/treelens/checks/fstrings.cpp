@@ -16,8 +16,8 @@ constexpr int kMaxBrackets = 200;
 
 class Scanner {
 public:
-  Scanner(const char *S, Py_ssize_t End, bool Raw, bool Py38, FieldScan &Out)
-      : S(S), End(End), Raw(Raw), Py38(Py38), Out(Out) {}
+  Scanner(const char *S, Py_ssize_t End, bool Raw, bool Py38, bool Py312, FieldScan &Out)
+      : S(S), End(End), Raw(Raw), Py38(Py38), Py312(Py312), Out(Out) {}
 
   /// The literal text and fields up to the end of the string (level 0) or
   /// of a format specification (the '}' that closes its field).
@@ -42,6 +42,7 @@ private:
   const char *S;
   Py_ssize_t End;
   bool Raw, Py38;
+  bool Py312; ///< 3.12's fields: one more level of nesting, backslashes allowed
   FieldScan &Out;
 
   bool fail(std::string Msg) {
@@ -94,7 +95,7 @@ private:
 
   /// One field, from its '{' past its '}'.
   bool field(Py_ssize_t &P, int Level) {
-    if (Level >= kMaxFieldNesting)
+    if (Level >= kMaxFieldNesting + (Py312 ? 1 : 0))
       return fail("f-string: expressions nested too deeply");
     Py_ssize_t Begin = ++P;
     char Quote = 0;
@@ -103,7 +104,7 @@ private:
     char Open[kMaxBrackets];
     for (; P < End; ++P) {
       char C = S[P];
-      if (C == '\\')
+      if (C == '\\' && !Py312)
         return fail("f-string expression part cannot include a backslash");
       if (Quote) {
         if (C == Quote) {
@@ -197,7 +198,7 @@ private:
 
 } // namespace
 
-void scanFString(const char *Tok, Py_ssize_t N, bool Py38, FieldScan &Out) {
+void scanFString(const char *Tok, Py_ssize_t N, bool Py38, bool Py312, FieldScan &Out) {
   // Prefix letters, then one or three quotes on each side.
   Py_ssize_t P = 0;
   bool Raw = false;
@@ -212,7 +213,7 @@ void scanFString(const char *Tok, Py_ssize_t N, bool Py38, FieldScan &Out) {
   Py_ssize_t Begin = P + Quotes, End = N - Quotes;
   if (End < Begin)
     return;
-  Scanner Sc(Tok, End, Raw, Py38, Out);
+  Scanner Sc(Tok, End, Raw, Py38, Py312, Out);
   Sc.fields(Begin, 0);
 }
 

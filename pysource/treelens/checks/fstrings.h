@@ -22,8 +22,9 @@ struct FieldScan {
 };
 
 /// Scans the f-string token Tok (prefix and quotes included). Py38 selects
-/// 3.8's reading: `=` fields and its bracket-matching messages.
-TL_HIDDEN void scanFString(const char *Tok, Py_ssize_t N, bool Py38, FieldScan &Out);
+/// 3.8's reading: `=` fields and its bracket-matching messages; Py312 3.12's
+/// nesting and backslashes in fields (its other rules need its own lexing).
+TL_HIDDEN void scanFString(const char *Tok, Py_ssize_t N, bool Py38, bool Py312, FieldScan &Out);
 
 } // namespace checks
 } // namespace treelens
