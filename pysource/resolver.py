@@ -36,7 +36,7 @@ import operator
 import os
 import re
 
-from pysource import utils
+from pysource import _fastaccess, utils
 
 # ---- Builtins per language version
 
@@ -132,7 +132,7 @@ _kAugOps = frozenset(['+=', '-=', '*=', '/=', '//=', '%=', '**=', '>>=', '<<=', 
 _kAssignOps = frozenset(['=', ':']) | _kAugOps
 _kOpen = {'(': ')', '[': ']', '{': '}'}
 _kClose = frozenset([')', ']', '}'])
-_kFirst = operator.itemgetter(0)
+_TokenTable = _fastaccess.GetLogicalTokenTable
 _kOrder = operator.attrgetter('order')
 _kBrackets = frozenset(['(', ')', '[', ']', '{', '}'])
 _kNonAscii = re.compile(br'[\x80-\xff]')
@@ -290,16 +290,21 @@ class _Line(object):
 
     def __init__(self, logical):
         first = logical.fFirstLine + 1
-        tokens = logical.fTokens
+        texts, rows, cols = _TokenTable(logical)
         line_text = logical.fLineText
         self.comments = ()
         if '#' in line_text or '\\' in line_text:
             # Comments and line continuations are tokens too.
-            self.comments = [(first + r, c + 1, t) for t, (r, c) in tokens if t[:1] == '#']
-            tokens = [tok for tok in tokens if tok[0][:1] != '#' and tok[0] != '\\']
-        self.texts = texts = map(_kFirst, tokens)
+            self.comments = [(first + rows[i], cols[i] + 1, t) for i, t in enumerate(texts)
+                             if t[:1] == '#']
+            keep = [i for i, t in enumerate(texts) if t[:1] != '#' and t != '\\']
+            if len(keep) < len(texts):
+                texts = [texts[i] for i in keep]
+                rows = [rows[i] for i in keep]
+                cols = [cols[i] for i in keep]
+        self.texts = texts
         self.kinds = frozenset(texts)   # to skip searches for what a line lacks
-        self.pos = _Positions(tokens, first)
+        self.pos = _Positions(rows, cols, first)
         self.n = len(texts)
         self.ascii = _kNonAscii.search(line_text) is None
         match = self.match = {}
@@ -317,15 +322,15 @@ class _Line(object):
 class _Positions(object):
     """The (line, column) of each token, 1-based, worked out when asked."""
 
-    __slots__ = ('tokens', 'first')
+    __slots__ = ('rows', 'cols', 'first')
 
-    def __init__(self, tokens, first):
-        self.tokens = tokens
+    def __init__(self, rows, cols, first):
+        self.rows = rows
+        self.cols = cols
         self.first = first
 
     def __getitem__(self, i):
-        row, col = self.tokens[i][1]
-        return self.first + row, col + 1
+        return self.first + self.rows[i], self.cols[i] + 1
 
 
 class _NameTest(dict):
@@ -1486,9 +1491,8 @@ def Resolve(result, stub=None):
             scope = module.module
         if kind in (21, 22):
             reader.record_index = index
-            for text, (row, col) in logical.fTokens:
-                if text[:1] == '#':
-                    _Comment(module, reader, text, logical.fFirstLine + row + 1, col + 1, scope)
+            if b'#' in logical.fLineText:
+                _Comments(module, reader, logical, scope)
             continue
         if last > scope.end_line:
             scope.end_line = last       # the enclosing scopes' ends follow below
@@ -1524,9 +1528,7 @@ def Resolve(result, stub=None):
                 for line, col, text in reader.line.comments:
                     _Comment(module, reader, text, line, col, scope)
         elif b'#' in logical.fLineText:
-            for text, (row, col) in logical.fTokens:
-                if text[:1] == '#':
-                    _Comment(module, reader, text, logical.fFirstLine + row + 1, col + 1, None)
+            _Comments(module, reader, logical, None)
         if first_text != '@':
             decorated = None
     module.module.end_line = last_line
@@ -1651,6 +1653,15 @@ def _Comment(module, reader, text, line, col, scope):
                     reader.line = saved
 
 
+def _Comments(module, reader, logical, scope):
+    """Reads the comments of a record the token reading does not see."""
+    texts, rows, cols = _TokenTable(logical)
+    first = logical.fFirstLine + 1
+    for i, text in enumerate(texts):
+        if text[:1] == '#':
+            _Comment(module, reader, text, first + rows[i], cols[i] + 1, scope)
+
+
 class _Position(object):
     """Stands for a line whose only token is at (line, col)."""
 
@@ -1725,9 +1736,8 @@ def LineNames(logical, names, reads):
     defines = ([defined] if defined is not None and defined not in names else []) + list(names)
     if not defines and not reads:
         return defines, [], []
-    tokens = logical.fTokens
+    texts, rows, cols = _TokenTable(logical)
     first = logical.fFirstLine + 1
-    texts = map(_kFirst, tokens)
     where = {}
     for name in set(defines) | set(n.split(b'.', 1)[0] for n in reads):
         at, i = [], -1
@@ -1745,8 +1755,7 @@ def LineNames(logical, names, reads):
         at = where.get(name)
         if at:
             taken.add(at[0])
-            row, col = tokens[at[0]][1]
-            defines_at.append((first + row, col + 1))
+            defines_at.append((first + rows[at[0]], cols[at[0]] + 1))
         else:
             defines_at.append(None)
     reads_at = []
@@ -1769,6 +1778,5 @@ def LineNames(logical, names, reads):
         if found is None:
             reads_at.append(None)
         else:
-            row, col = tokens[found][1]
-            reads_at.append((first + row, col + 1))
+            reads_at.append((first + rows[found], cols[found] + 1))
     return defines, defines_at, reads_at
