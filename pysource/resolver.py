@@ -133,9 +133,8 @@ _kAssignOps = frozenset(['=', ':']) | _kAugOps
 _kOpen = {'(': ')', '[': ']', '{': '}'}
 _kClose = frozenset([')', ']', '}'])
 _TokenTable = _fastaccess.GetLogicalTokenTable
+_LineTable = _fastaccess.GetLogicalLineTable
 _kOrder = operator.attrgetter('order')
-_kBrackets = frozenset(['(', ')', '[', ']', '{', '}'])
-_kNonAscii = re.compile(br'[\x80-\xff]')
 _kFString = re.compile(br'(?<![A-Za-z0-9_])[rR]?[fF][rR]?[\'"]')
 _kCompoundHeads = frozenset(['if', 'elif', 'while', 'for', 'with', 'try', 'except', 'else',
                              'finally', 'def', 'class'])
@@ -289,48 +288,24 @@ class _Line(object):
     __slots__ = ('texts', 'pos', 'match', 'n', 'comments', 'ascii', 'kinds')
 
     def __init__(self, logical):
-        first = logical.fFirstLine + 1
-        texts, rows, cols = _TokenTable(logical)
-        line_text = logical.fLineText
-        self.comments = ()
-        if '#' in line_text or '\\' in line_text:
-            # Comments and line continuations are tokens too.
-            self.comments = [(first + rows[i], cols[i] + 1, t) for i, t in enumerate(texts)
-                             if t[:1] == '#']
-            keep = [i for i, t in enumerate(texts) if t[:1] != '#' and t != '\\']
-            if len(keep) < len(texts):
-                texts = [texts[i] for i in keep]
-                rows = [rows[i] for i in keep]
-                cols = [cols[i] for i in keep]
+        texts, lines, cols, self.comments, self.match, self.ascii = _LineTable(logical)
         self.texts = texts
         self.kinds = frozenset(texts)   # to skip searches for what a line lacks
-        self.pos = _Positions(rows, cols, first)
+        self.pos = _Positions(lines, cols)
         self.n = len(texts)
-        self.ascii = _kNonAscii.search(line_text) is None
-        match = self.match = {}
-        if '(' in line_text or '[' in line_text or '{' in line_text:
-            stack = []
-            for i in [i for i, t in enumerate(texts) if t in _kBrackets]:
-                if texts[i] in _kOpen:
-                    stack.append(i)
-                elif stack:
-                    match[stack.pop()] = i
-            for i in stack:
-                match[i] = len(texts)
 
 
 class _Positions(object):
-    """The (line, column) of each token, 1-based, worked out when asked."""
+    """The (line, column) of each token, 1-based, paired when asked."""
 
-    __slots__ = ('rows', 'cols', 'first')
+    __slots__ = ('lines', 'cols')
 
-    def __init__(self, rows, cols, first):
-        self.rows = rows
+    def __init__(self, lines, cols):
+        self.lines = lines
         self.cols = cols
-        self.first = first
 
     def __getitem__(self, i):
-        return self.first + self.rows[i], self.cols[i] + 1
+        return self.lines[i], self.cols[i]
 
 
 class _NameTest(dict):

@@ -1,6 +1,7 @@
 // Module pysource._fastaccess: record operations, tokenizer functions and the native API capsule.
 #include "pysource/_fastaccess/internal.h"
 #include "pysource/_fastaccess/jointokens.h"
+#include "pysource/_fastaccess/linetable.h"
 #include "pysource/_fastaccess/literals.h"
 #include "pysource/_fastaccess/records.h"
 
@@ -76,6 +77,10 @@ PyObject *f_logical_token_table(PyObject *, PyObject *Logical) {
   });
 }
 
+PyObject *f_logical_line_table(PyObject *, PyObject *Logical) {
+  return guard<PyObject *>(nullptr, [&] { return lineTable(Logical).release(); });
+}
+
 PyObject *f_token_type(PyObject *, PyObject *Text) {
   return guard<PyObject *>(nullptr, [&] {
     const char *Buf;
@@ -145,6 +150,11 @@ PyMethodDef Functions[] = {
     {"GetLogicalTokenTable", f_logical_token_table, METH_O,
      "GetLogicalTokenTable(logical) -> (texts, rows, cols): lists of the tokens' texts and\n"
      "0-based positions (row within the record)."},
+    {"GetLogicalLineTable", f_logical_line_table, METH_O,
+     "GetLogicalLineTable(logical) -> (texts, lines, cols, comments, match, ascii): the texts\n"
+     "and 1-based positions of the tokens that are not comments or line continuations,\n"
+     "[(line, col, text)] of the comments, {index of an opening bracket: index of the\n"
+     "bracket that closes it, or len(texts)}, and whether the line text is all ASCII."},
     {"GetTokenType", f_token_type, METH_O,
      "GetTokenType(text) -> int: the type code of the token that text begins with."},
     {"Tokenize", f_tokenize, METH_O,

@@ -422,6 +422,64 @@ class LineViewTest(unittest.TestCase):
         self.assertEqual(doc['diagnostics'], [])
 
 
+class TokenTableTest(unittest.TestCase):
+    """The native token tables the resolver reads records through, judged by
+    the records' (text, (row, col)) view."""
+
+    kSources = [
+        b'x = 1\n',
+        b'def f(a, (b, c)=d):  # note\n',
+        b'y = [1,\n     2] + {3: (4)}\n',
+        b'z = f(a)) + (b\n',           # a stray close, an open one left
+        b'w = x \\\n    + 1  # after\n',
+        b'\xc3\xa9 = "\xc3\xa9"\n',
+        b'# only a comment\n',
+        b'',
+    ]
+
+    def Records(self):
+        for source in self.kSources:
+            for logical in analysis.AnalyzeText(source, '2.7', b'p.py').logicals:
+                yield source, logical
+
+    def testTablesFollowTheTokens(self):
+        from pysource import _fastaccess as fa
+        for source, L in self.Records():
+            first = L.fFirstLine + 1
+            texts, rows, cols = fa.GetLogicalTokenTable(L)
+            self.assertEqual(zip(texts, zip(rows, cols)), list(L.fTokens), source)
+            kept = [(t, (first + r, c + 1)) for t, (r, c) in L.fTokens
+                    if t[:1] != b'#' and t != b'\\']
+            texts, lines, cols, comments, match, ascii = fa.GetLogicalLineTable(L)
+            self.assertEqual(zip(texts, zip(lines, cols)), kept, source)
+            self.assertEqual(comments, [(first + r, c + 1, t) for t, (r, c) in L.fTokens
+                                        if t[:1] == b'#'], source)
+            self.assertEqual(ascii, max(L.fLineText or b' ') < b'\x80', source)
+            stack, expected = [], {}
+            for i, t in enumerate(texts):
+                if t in (b'(', b'[', b'{'):
+                    stack.append(i)
+                elif t in (b')', b']', b'}') and stack:
+                    expected[stack.pop()] = i
+            expected.update((i, len(texts)) for i in stack)
+            self.assertEqual(match, expected, source)
+
+    def testBadArgumentsAndReferences(self):
+        import sys
+        from pysource import _fastaccess as fa
+        for call in (fa.GetLogicalTokenTable, fa.GetLogicalLineTable):
+            for bad in (None, [], b'x = 1'):
+                self.assertRaisesRegexp(TypeError, 'Argument must be a logical', call, bad)
+        L = analysis.AnalyzeText(b'x = f(y)  # c\n', '3.8', b'p.py').logicals[0]
+        texts = fa.GetLogicalTokenTable(L)[0]
+        for call in (fa.GetLogicalTokenTable, fa.GetLogicalLineTable):
+            call(L)
+            before = [sys.getrefcount(t) for t in texts] + [sys.getrefcount(L)]
+            for _ in range(100):
+                call(L)
+            self.assertEqual([sys.getrefcount(t) for t in texts] + [sys.getrefcount(L)], before)
+
+
 # ---- the corpus judges
 
 def CheckDefinitions(test, module):
