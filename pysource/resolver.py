@@ -1455,18 +1455,19 @@ def Resolve(result, stub=None):
     decorated = None
     errors = result.errors or [None] * len(result.logicals)
     last_line = 1
+    top = module.module
     for index, (logical, error) in enumerate(zip(result.logicals, errors)):
         kind = logical.fKind
-        last = logical.fFirstLine + logical.fLineText.count(b'\n') + \
-            (0 if logical.fLineText.endswith(b'\n') else 1)
-        last_line = max(last_line, last)
+        line_text = logical.fLineText
+        last = logical.fFirstLine + line_text.count(b'\n') + \
+            (0 if line_text.endswith(b'\n') else 1)
+        if last > last_line:
+            last_line = last
         parent = logical.fParentScope
-        scope = scopes.get(id(parent)) if parent is not None else module.module
-        if scope is None:
-            scope = module.module
-        if kind in (21, 22):
+        scope = scopes.get(id(parent), top) if parent is not None else top
+        if kind == 21 or kind == 22:
             reader.record_index = index
-            if b'#' in logical.fLineText:
+            if b'#' in line_text:
                 _Comments(module, reader, logical, scope)
             continue
         if last > scope.end_line:
@@ -1502,7 +1503,7 @@ def Resolve(result, stub=None):
             if reader.line is not None:
                 for line, col, text in reader.line.comments:
                     _Comment(module, reader, text, line, col, scope)
-        elif b'#' in logical.fLineText:
+        elif b'#' in line_text:
             _Comments(module, reader, logical, None)
         if first_text != '@':
             decorated = None
@@ -1703,7 +1704,7 @@ def LineNames(logical, names, reads):
     defines with the def or class name first, and the (line, column) of each
     defined and each read name (1-based; None when not found).
 
-    One pass over the tokens: a defined name is at its first occurrence that
+    Found in the record's tokens natively: a defined name is at its first occurrence that
     does not follow a dot, a read name (dotted or not) at its first such
     occurrence that no defined name took, or at the f-string that holds it.
     """
@@ -1711,47 +1712,5 @@ def LineNames(logical, names, reads):
     defines = ([defined] if defined is not None and defined not in names else []) + list(names)
     if not defines and not reads:
         return defines, [], []
-    texts, rows, cols = _TokenTable(logical)
-    first = logical.fFirstLine + 1
-    where = {}
-    for name in set(defines) | set(n.split(b'.', 1)[0] for n in reads):
-        at, i = [], -1
-        while True:
-            try:
-                i = texts.index(name, i + 1)
-            except ValueError:
-                break
-            if i == 0 or texts[i - 1] != '.':
-                at.append(i)
-        where[name] = at
-    taken = set()
-    defines_at = []
-    for name in defines:
-        at = where.get(name)
-        if at:
-            taken.add(at[0])
-            defines_at.append((first + rows[at[0]], cols[at[0]] + 1))
-        else:
-            defines_at.append(None)
-    reads_at = []
-    for name in reads:
-        parts = name.split(b'.')
-        found = None
-        for i in where.get(parts[0], ()):
-            if all(i + 2 * k < len(texts) and texts[i + 2 * k - 1] == '.' and
-                   texts[i + 2 * k] == part for k, part in enumerate(parts[1:], 1)):
-                if i not in taken:
-                    found = i
-                    break
-                if found is None:
-                    found = i
-        if found is None:
-            for i, text in enumerate(texts):
-                if text[-1:] in '\'"' and parts[0] in text:
-                    found = i
-                    break
-        if found is None:
-            reads_at.append(None)
-        else:
-            reads_at.append((first + rows[found], cols[found] + 1))
+    defines_at, reads_at = _fastaccess.LineNameColumns(logical, defines, reads)
     return defines, defines_at, reads_at

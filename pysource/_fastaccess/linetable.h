@@ -10,6 +10,10 @@ namespace fastaccess {
 /// GetLogicalLineTable's doc string); throws on failure.
 TL_HIDDEN tl::Ref lineTable(PyObject *Logical);
 
+/// New reference: (defines_at, reads_at), the (line, col) or None of each
+/// name of the sequences Defines and Reads (bytes) in the record's tokens.
+TL_HIDDEN tl::Ref lineNameColumns(PyObject *Logical, PyObject *Defines, PyObject *Reads);
+
 } // namespace fastaccess
 
 #endif

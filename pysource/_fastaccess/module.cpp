@@ -81,6 +81,15 @@ PyObject *f_logical_line_table(PyObject *, PyObject *Logical) {
   return guard<PyObject *>(nullptr, [&] { return lineTable(Logical).release(); });
 }
 
+PyObject *f_line_name_columns(PyObject *, PyObject *Args) {
+  return guard<PyObject *>(nullptr, [&]() -> PyObject * {
+    PyObject *Logical, *Defines, *Reads;
+    if (!PyArg_ParseTuple(Args, "OOO:LineNameColumns", &Logical, &Defines, &Reads))
+      return nullptr;
+    return lineNameColumns(Logical, Defines, Reads).release();
+  });
+}
+
 PyObject *f_token_type(PyObject *, PyObject *Text) {
   return guard<PyObject *>(nullptr, [&] {
     const char *Buf;
@@ -155,6 +164,9 @@ PyMethodDef Functions[] = {
      "and 1-based positions of the tokens that are not comments or line continuations,\n"
      "[(line, col, text)] of the comments, {index of an opening bracket: index of the\n"
      "bracket that closes it, or len(texts)}, and whether the line text is all ASCII."},
+    {"LineNameColumns", f_line_name_columns, METH_VARARGS,
+     "LineNameColumns(logical, defines, reads) -> (defines_at, reads_at): the 1-based\n"
+     "(line, col) of each name in the record's tokens, or None (see resolver.LineNames)."},
     {"GetTokenType", f_token_type, METH_O,
      "GetTokenType(text) -> int: the type code of the token that text begins with."},
     {"Tokenize", f_tokenize, METH_O,

@@ -464,6 +464,23 @@ class TokenTableTest(unittest.TestCase):
             expected.update((i, len(texts)) for i in stack)
             self.assertEqual(match, expected, source)
 
+    def testNameColumns(self):
+        from pysource import _fastaccess as fa
+        cases = [
+            # source, defines, reads, defines_at, reads_at
+            (b'x = x + a.b\n', [b'x'], [b'x', b'a', b'a.b'], [(1, 1)], [(1, 5), (1, 9), (1, 9)]),
+            (b'a.x = x\n', [b'x'], [b'x'], [(1, 7)], [(1, 7)]),       # not after a dot
+            (b'y = a.b.c + a.b.d\n', [], [b'a.b.d', b'a.b.e'], [], [(1, 13), None]),
+            (b'z = f"{q}" + \'q\'\n', [b'z'], [b'q', b'w'], [(1, 1)], [(1, 5), None]),
+            (b'u = (1,\n     v)  # v\n', [b'u', b'u'], [b'v'], [(1, 1), (1, 1)], [(2, 6)]),
+        ]
+        for source, defines, reads, defines_at, reads_at in cases:
+            L = analysis.AnalyzeText(source, '3.8', b'p.py').logicals[0]
+            self.assertEqual(fa.LineNameColumns(L, defines, reads), (defines_at, reads_at),
+                             source)
+            self.assertEqual(fa.LineNameColumns(L, tuple(defines), iter(reads)),
+                             (defines_at, reads_at), source)
+
     def testBadArgumentsAndReferences(self):
         import sys
         from pysource import _fastaccess as fa
@@ -471,13 +488,20 @@ class TokenTableTest(unittest.TestCase):
             for bad in (None, [], b'x = 1'):
                 self.assertRaisesRegexp(TypeError, 'Argument must be a logical', call, bad)
         L = analysis.AnalyzeText(b'x = f(y)  # c\n', '3.8', b'p.py').logicals[0]
+        for defines, reads, error in [(None, [], 'sequence of bytes'), ([b'x'], [1], 'bytes'),
+                                      ([u'x'], [], 'bytes'), ([], b'y', 'bytes')]:
+            self.assertRaisesRegexp(TypeError, error, fa.LineNameColumns, L, defines, reads)
+        self.assertRaisesRegexp(TypeError, 'Argument must be a logical', fa.LineNameColumns,
+                                None, [], [])
         texts = fa.GetLogicalTokenTable(L)[0]
-        for call in (fa.GetLogicalTokenTable, fa.GetLogicalLineTable):
+        names = [b'x', b'f.g']
+        for call in (fa.GetLogicalTokenTable, fa.GetLogicalLineTable,
+                     lambda L: fa.LineNameColumns(L, names[:1], names)):
             call(L)
-            before = [sys.getrefcount(t) for t in texts] + [sys.getrefcount(L)]
+            before = [sys.getrefcount(o) for o in texts + names + [L]]
             for _ in range(100):
                 call(L)
-            self.assertEqual([sys.getrefcount(t) for t in texts] + [sys.getrefcount(L)], before)
+            self.assertEqual([sys.getrefcount(o) for o in texts + names + [L]], before)
 
 
 # ---- the corpus judges
