@@ -367,7 +367,9 @@ class _Reader(object):
         scope.references.append(r)
         if self.in_string:
             return r
-        scope.AddFlag(name, USE)
+        key = scope.Mangle(name) if name[:2] == '__' else name
+        flags = scope.flags
+        flags[key] = flags.get(key, 0) | USE
         if name == 'super' and scope.kind == 'function' and not self.py2:
             scope.AddFlag('__class__', USE)
         elif name == 'locals':
@@ -399,6 +401,8 @@ class _Reader(object):
 
     def Split(self, a, b, sep):
         """[(start, end)] of the parts of [a, b) between sep at depth 0."""
+        if self.line.kinds.isdisjoint(sep):
+            return [(a, b)] if a <= b else []
         parts = []
         while a <= b:
             j = self.FindAtDepth0(a, b, sep)
@@ -669,6 +673,9 @@ class _Reader(object):
             self.Expr(1, n, scope)
             return
         if head not in _kCompoundHeads:
+            if ';' not in line.kinds:
+                self.Simple(0, n, scope)
+                return
             for s, e in self.Split(0, n, (';',)):
                 if s < e:
                     self.Simple(s, e, scope)
