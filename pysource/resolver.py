@@ -472,7 +472,7 @@ class _Reader(object):
         """Call arguments in [a, b): keyword names are not read; a lone
         generator expression is a comprehension."""
         texts = self.line.texts
-        if self.FindAtDepth0(a, b, ('for',)) < b:
+        if 'for' in self.line.kinds and self.FindAtDepth0(a, b, ('for',)) < b:
             self.Comprehension(a - 1, b, scope, 'genexpr')
             return
         for s, e in self.Split(a, b, (',',)):
@@ -787,7 +787,8 @@ class _Reader(object):
                                                   'await', 'yield'):
             self.Expr(a + 1, b, scope)
             return
-        eq = self.FindAtDepth0(a, b, _kAssignOps)
+        eq = b if self.line.kinds.isdisjoint(_kAssignOps) else \
+            self.FindAtDepth0(a, b, _kAssignOps)
         if eq == b:
             self.Expr(a, b, scope)
             return
@@ -1068,7 +1069,11 @@ class Module(object):
                     scope = scope.parent
                 first, deferred = False, True
                 continue
-            candidates, orders, live, live_orders = scope.Candidates(name)
+            by_name = scope._by_name
+            if by_name is not None and name not in by_name:
+                candidates = None       # nothing of that name bound here
+            else:
+                candidates, orders, live, live_orders = scope.Candidates(name)
             if candidates:
                 if deferred or scope.kind in ('lambda', 'comprehension'):
                     if deferred and candidates[-1].kind == kDel and not candidates[-1].clauses \
