@@ -361,8 +361,9 @@ class _Reader(object):
     def Use(self, scope, name, i, annotation=False):
         if self.normalize and not self.line.ascii and max(name) >= '\x80':
             name = _Normalize(name)
-        line, col = self.line.pos[i]
-        r = Reference(name, line, col, scope, (self.record_index, i), self.clauses)
+        pos = self.line.pos
+        r = Reference(name, pos.lines[i], pos.cols[i], scope, (self.record_index, i),
+                      self.clauses)
         r.annotation = annotation
         scope.references.append(r)
         if self.in_string:
@@ -882,14 +883,16 @@ class _Reader(object):
         try:
             sub = _Line(logicals[0])
             if before_text is None:
-                sub.pos = [(line0, col0)] * sub.n
+                sub.pos = _Positions([line0] * sub.n, [col0] * sub.n)
             else:
                 rows = before_text.count(b'\n')
                 base_line = line0 + rows
                 base_col = col0 + len(before_text) if not rows else \
                     len(before_text) - before_text.rfind(b'\n')
-                sub.pos = [(base_line + l - 1, base_col + c - 2 if l == 1 else c)
-                           for l, c in sub.pos]
+                lines, cols = sub.pos.lines, sub.pos.cols
+                sub.pos = _Positions([base_line + l - 1 for l in lines],
+                                     [base_col + c - 2 if l == 1 else c
+                                      for l, c in zip(lines, cols)])
             if annotation and not _LooksLikeExpression(sub.texts, self.keywords):
                 return
             self.line = sub
@@ -1654,7 +1657,7 @@ class _Position(object):
     """Stands for a line whose only token is at (line, col)."""
 
     def __init__(self, line, col):
-        self.pos = [(line, col)]
+        self.pos = _Positions([line], [col])
         self.n = 1
         self.ascii = False
         self.kinds = frozenset()
