@@ -15,16 +15,22 @@ bool isText(PyObject *T, char C) {
   return T && PyString_GET_SIZE(T) == 1 && PyString_AS_STRING(T)[0] == C;
 }
 
-bool isComment(PyObject *T) { return T && PyString_GET_SIZE(T) > 0 && PyString_AS_STRING(T)[0] == '#'; }
+bool isComment(PyObject *T) {
+  return T && PyString_GET_SIZE(T) > 0 && PyString_AS_STRING(T)[0] == '#';
+}
 
 /// 0 for no bracket, 1 for an opening one, -1 for a closing one.
 int bracketOf(PyObject *T) {
   if (!T || PyString_GET_SIZE(T) != 1)
     return 0;
   switch (PyString_AS_STRING(T)[0]) {
-  case '(': case '[': case '{':
+  case '(':
+  case '[':
+  case '{':
     return 1;
-  case ')': case ']': case '}':
+  case ')':
+  case ']':
+  case '}':
     return -1;
   default:
     return 0;
