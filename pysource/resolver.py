@@ -36,7 +36,7 @@ import operator
 import os
 import re
 
-from pysource import utils
+from pysource import _fastaccess, utils
 
 # ---- Builtins per language version
 
@@ -132,10 +132,9 @@ _kAugOps = frozenset(['+=', '-=', '*=', '/=', '//=', '%=', '**=', '>>=', '<<=', 
 _kAssignOps = frozenset(['=', ':']) | _kAugOps
 _kOpen = {'(': ')', '[': ']', '{': '}'}
 _kClose = frozenset([')', ']', '}'])
-_kFirst = operator.itemgetter(0)
+_TokenTable = _fastaccess.GetLogicalTokenTable
+_LineTable = _fastaccess.GetLogicalLineTable
 _kOrder = operator.attrgetter('order')
-_kBrackets = frozenset(['(', ')', '[', ']', '{', '}'])
-_kNonAscii = re.compile(br'[\x80-\xff]')
 _kFString = re.compile(br'(?<![A-Za-z0-9_])[rR]?[fF][rR]?[\'"]')
 _kCompoundHeads = frozenset(['if', 'elif', 'while', 'for', 'with', 'try', 'except', 'else',
                              'finally', 'def', 'class'])
@@ -289,43 +288,24 @@ class _Line(object):
     __slots__ = ('texts', 'pos', 'match', 'n', 'comments', 'ascii', 'kinds')
 
     def __init__(self, logical):
-        first = logical.fFirstLine + 1
-        tokens = logical.fTokens
-        line_text = logical.fLineText
-        self.comments = ()
-        if '#' in line_text or '\\' in line_text:
-            # Comments and line continuations are tokens too.
-            self.comments = [(first + r, c + 1, t) for t, (r, c) in tokens if t[:1] == '#']
-            tokens = [tok for tok in tokens if tok[0][:1] != '#' and tok[0] != '\\']
-        self.texts = texts = map(_kFirst, tokens)
+        texts, lines, cols, self.comments, self.match, self.ascii = _LineTable(logical)
+        self.texts = texts
         self.kinds = frozenset(texts)   # to skip searches for what a line lacks
-        self.pos = _Positions(tokens, first)
+        self.pos = _Positions(lines, cols)
         self.n = len(texts)
-        self.ascii = _kNonAscii.search(line_text) is None
-        match = self.match = {}
-        if '(' in line_text or '[' in line_text or '{' in line_text:
-            stack = []
-            for i in [i for i, t in enumerate(texts) if t in _kBrackets]:
-                if texts[i] in _kOpen:
-                    stack.append(i)
-                elif stack:
-                    match[stack.pop()] = i
-            for i in stack:
-                match[i] = len(texts)
 
 
 class _Positions(object):
-    """The (line, column) of each token, 1-based, worked out when asked."""
+    """The (line, column) of each token, 1-based, paired when asked."""
 
-    __slots__ = ('tokens', 'first')
+    __slots__ = ('lines', 'cols')
 
-    def __init__(self, tokens, first):
-        self.tokens = tokens
-        self.first = first
+    def __init__(self, lines, cols):
+        self.lines = lines
+        self.cols = cols
 
     def __getitem__(self, i):
-        row, col = self.tokens[i][1]
-        return self.first + row, col + 1
+        return self.lines[i], self.cols[i]
 
 
 class _NameTest(dict):
@@ -381,13 +361,16 @@ class _Reader(object):
     def Use(self, scope, name, i, annotation=False):
         if self.normalize and not self.line.ascii and max(name) >= '\x80':
             name = _Normalize(name)
-        line, col = self.line.pos[i]
-        r = Reference(name, line, col, scope, (self.record_index, i), self.clauses)
+        pos = self.line.pos
+        r = Reference(name, pos.lines[i], pos.cols[i], scope, (self.record_index, i),
+                      self.clauses)
         r.annotation = annotation
         scope.references.append(r)
         if self.in_string:
             return r
-        scope.AddFlag(name, USE)
+        key = scope.Mangle(name) if name[:2] == '__' else name
+        flags = scope.flags
+        flags[key] = flags.get(key, 0) | USE
         if name == 'super' and scope.kind == 'function' and not self.py2:
             scope.AddFlag('__class__', USE)
         elif name == 'locals':
@@ -419,6 +402,8 @@ class _Reader(object):
 
     def Split(self, a, b, sep):
         """[(start, end)] of the parts of [a, b) between sep at depth 0."""
+        if self.line.kinds.isdisjoint(sep):
+            return [(a, b)] if a <= b else []
         parts = []
         while a <= b:
             j = self.FindAtDepth0(a, b, sep)
@@ -488,7 +473,7 @@ class _Reader(object):
         """Call arguments in [a, b): keyword names are not read; a lone
         generator expression is a comprehension."""
         texts = self.line.texts
-        if self.FindAtDepth0(a, b, ('for',)) < b:
+        if 'for' in self.line.kinds and self.FindAtDepth0(a, b, ('for',)) < b:
             self.Comprehension(a - 1, b, scope, 'genexpr')
             return
         for s, e in self.Split(a, b, (',',)):
@@ -689,6 +674,9 @@ class _Reader(object):
             self.Expr(1, n, scope)
             return
         if head not in _kCompoundHeads:
+            if ';' not in line.kinds:
+                self.Simple(0, n, scope)
+                return
             for s, e in self.Split(0, n, (';',)):
                 if s < e:
                     self.Simple(s, e, scope)
@@ -800,7 +788,8 @@ class _Reader(object):
                                                   'await', 'yield'):
             self.Expr(a + 1, b, scope)
             return
-        eq = self.FindAtDepth0(a, b, _kAssignOps)
+        eq = b if self.line.kinds.isdisjoint(_kAssignOps) else \
+            self.FindAtDepth0(a, b, _kAssignOps)
         if eq == b:
             self.Expr(a, b, scope)
             return
@@ -894,14 +883,16 @@ class _Reader(object):
         try:
             sub = _Line(logicals[0])
             if before_text is None:
-                sub.pos = [(line0, col0)] * sub.n
+                sub.pos = _Positions([line0] * sub.n, [col0] * sub.n)
             else:
                 rows = before_text.count(b'\n')
                 base_line = line0 + rows
                 base_col = col0 + len(before_text) if not rows else \
                     len(before_text) - before_text.rfind(b'\n')
-                sub.pos = [(base_line + l - 1, base_col + c - 2 if l == 1 else c)
-                           for l, c in sub.pos]
+                lines, cols = sub.pos.lines, sub.pos.cols
+                sub.pos = _Positions([base_line + l - 1 for l in lines],
+                                     [base_col + c - 2 if l == 1 else c
+                                      for l, c in zip(lines, cols)])
             if annotation and not _LooksLikeExpression(sub.texts, self.keywords):
                 return
             self.line = sub
@@ -1081,7 +1072,11 @@ class Module(object):
                     scope = scope.parent
                 first, deferred = False, True
                 continue
-            candidates, orders, live, live_orders = scope.Candidates(name)
+            by_name = scope._by_name
+            if by_name is not None and name not in by_name:
+                candidates = None       # nothing of that name bound here
+            else:
+                candidates, orders, live, live_orders = scope.Candidates(name)
             if candidates:
                 if deferred or scope.kind in ('lambda', 'comprehension'):
                     if deferred and candidates[-1].kind == kDel and not candidates[-1].clauses \
@@ -1475,20 +1470,20 @@ def Resolve(result, stub=None):
     decorated = None
     errors = result.errors or [None] * len(result.logicals)
     last_line = 1
+    top = module.module
     for index, (logical, error) in enumerate(zip(result.logicals, errors)):
         kind = logical.fKind
-        last = logical.fFirstLine + logical.fLineText.count(b'\n') + \
-            (0 if logical.fLineText.endswith(b'\n') else 1)
-        last_line = max(last_line, last)
+        line_text = logical.fLineText
+        last = logical.fFirstLine + line_text.count(b'\n') + \
+            (0 if line_text.endswith(b'\n') else 1)
+        if last > last_line:
+            last_line = last
         parent = logical.fParentScope
-        scope = scopes.get(id(parent)) if parent is not None else module.module
-        if scope is None:
-            scope = module.module
-        if kind in (21, 22):
+        scope = scopes.get(id(parent), top) if parent is not None else top
+        if kind == 21 or kind == 22:
             reader.record_index = index
-            for text, (row, col) in logical.fTokens:
-                if text[:1] == '#':
-                    _Comment(module, reader, text, logical.fFirstLine + row + 1, col + 1, scope)
+            if b'#' in line_text:
+                _Comments(module, reader, logical, scope)
             continue
         if last > scope.end_line:
             scope.end_line = last       # the enclosing scopes' ends follow below
@@ -1523,10 +1518,8 @@ def Resolve(result, stub=None):
             if reader.line is not None:
                 for line, col, text in reader.line.comments:
                     _Comment(module, reader, text, line, col, scope)
-        elif b'#' in logical.fLineText:
-            for text, (row, col) in logical.fTokens:
-                if text[:1] == '#':
-                    _Comment(module, reader, text, logical.fFirstLine + row + 1, col + 1, None)
+        elif b'#' in line_text:
+            _Comments(module, reader, logical, None)
         if first_text != '@':
             decorated = None
     module.module.end_line = last_line
@@ -1651,11 +1644,20 @@ def _Comment(module, reader, text, line, col, scope):
                     reader.line = saved
 
 
+def _Comments(module, reader, logical, scope):
+    """Reads the comments of a record the token reading does not see."""
+    texts, rows, cols = _TokenTable(logical)
+    first = logical.fFirstLine + 1
+    for i, text in enumerate(texts):
+        if text[:1] == '#':
+            _Comment(module, reader, text, first + rows[i], cols[i] + 1, scope)
+
+
 class _Position(object):
     """Stands for a line whose only token is at (line, col)."""
 
     def __init__(self, line, col):
-        self.pos = [(line, col)]
+        self.pos = _Positions([line], [col])
         self.n = 1
         self.ascii = False
         self.kinds = frozenset()
@@ -1717,7 +1719,7 @@ def LineNames(logical, names, reads):
     defines with the def or class name first, and the (line, column) of each
     defined and each read name (1-based; None when not found).
 
-    One pass over the tokens: a defined name is at its first occurrence that
+    Found in the record's tokens natively: a defined name is at its first occurrence that
     does not follow a dot, a read name (dotted or not) at its first such
     occurrence that no defined name took, or at the f-string that holds it.
     """
@@ -1725,50 +1727,5 @@ def LineNames(logical, names, reads):
     defines = ([defined] if defined is not None and defined not in names else []) + list(names)
     if not defines and not reads:
         return defines, [], []
-    tokens = logical.fTokens
-    first = logical.fFirstLine + 1
-    texts = map(_kFirst, tokens)
-    where = {}
-    for name in set(defines) | set(n.split(b'.', 1)[0] for n in reads):
-        at, i = [], -1
-        while True:
-            try:
-                i = texts.index(name, i + 1)
-            except ValueError:
-                break
-            if i == 0 or texts[i - 1] != '.':
-                at.append(i)
-        where[name] = at
-    taken = set()
-    defines_at = []
-    for name in defines:
-        at = where.get(name)
-        if at:
-            taken.add(at[0])
-            row, col = tokens[at[0]][1]
-            defines_at.append((first + row, col + 1))
-        else:
-            defines_at.append(None)
-    reads_at = []
-    for name in reads:
-        parts = name.split(b'.')
-        found = None
-        for i in where.get(parts[0], ()):
-            if all(i + 2 * k < len(texts) and texts[i + 2 * k - 1] == '.' and
-                   texts[i + 2 * k] == part for k, part in enumerate(parts[1:], 1)):
-                if i not in taken:
-                    found = i
-                    break
-                if found is None:
-                    found = i
-        if found is None:
-            for i, text in enumerate(texts):
-                if text[-1:] in '\'"' and parts[0] in text:
-                    found = i
-                    break
-        if found is None:
-            reads_at.append(None)
-        else:
-            row, col = tokens[found][1]
-            reads_at.append((first + row, col + 1))
+    defines_at, reads_at = _fastaccess.LineNameColumns(logical, defines, reads)
     return defines, defines_at, reads_at

@@ -1,6 +1,7 @@
 // Module pysource._fastaccess: record operations, tokenizer functions and the native API capsule.
 #include "pysource/_fastaccess/internal.h"
 #include "pysource/_fastaccess/jointokens.h"
+#include "pysource/_fastaccess/linetable.h"
 #include "pysource/_fastaccess/literals.h"
 #include "pysource/_fastaccess/records.h"
 
@@ -53,6 +54,39 @@ PyObject *f_logical_token_type(PyObject *, PyObject *Args) {
     if (I < 0 || I >= L->TokenCount)
       tl::raise(PyExc_IndexError, msg::Index);
     return PyInt_FromLong(L->Types[I]);
+  });
+}
+
+/// (texts, rows, cols): three lists over a record's tokens, in one call, so
+/// callers that read every token build no per-token tuples.
+PyObject *f_logical_token_table(PyObject *, PyObject *Logical) {
+  return guard<PyObject *>(nullptr, [&] {
+    LogicalLineObject *L = asLogical(Logical);
+    const Py_ssize_t N = L->TokenCount;
+    Ref Texts = require(PyList_New(N));
+    Ref Rows = require(PyList_New(N));
+    Ref Cols = require(PyList_New(N));
+    for (Py_ssize_t I = 0; I < N; ++I) {
+      PyObject *Text = L->Texts[I] ? L->Texts[I] : Py_None;
+      Py_INCREF(Text);
+      PyList_SET_ITEM(Texts.get(), I, Text);
+      PyList_SET_ITEM(Rows.get(), I, require(PyInt_FromLong(L->Positions[I].Row)).release());
+      PyList_SET_ITEM(Cols.get(), I, require(PyInt_FromLong(L->Positions[I].Col)).release());
+    }
+    return require(PyTuple_Pack(3, Texts.get(), Rows.get(), Cols.get())).release();
+  });
+}
+
+PyObject *f_logical_line_table(PyObject *, PyObject *Logical) {
+  return guard<PyObject *>(nullptr, [&] { return lineTable(Logical).release(); });
+}
+
+PyObject *f_line_name_columns(PyObject *, PyObject *Args) {
+  return guard<PyObject *>(nullptr, [&]() -> PyObject * {
+    PyObject *Logical, *Defines, *Reads;
+    if (!PyArg_ParseTuple(Args, "OOO:LineNameColumns", &Logical, &Defines, &Reads))
+      return nullptr;
+    return lineNameColumns(Logical, Defines, Reads).release();
   });
 }
 
@@ -122,6 +156,17 @@ PyMethodDef Functions[] = {
      "AppendLogicalTypeEquiv(logical, name, info): appends (name, info) to fTypeEquivs."},
     {"GetLogicalTokenType", f_logical_token_type, METH_VARARGS,
      "GetLogicalTokenType(logical, i) -> int: the type code of token i."},
+    {"GetLogicalTokenTable", f_logical_token_table, METH_O,
+     "GetLogicalTokenTable(logical) -> (texts, rows, cols): lists of the tokens' texts and\n"
+     "0-based positions (row within the record)."},
+    {"GetLogicalLineTable", f_logical_line_table, METH_O,
+     "GetLogicalLineTable(logical) -> (texts, lines, cols, comments, match, ascii): the texts\n"
+     "and 1-based positions of the tokens that are not comments or line continuations,\n"
+     "[(line, col, text)] of the comments, {index of an opening bracket: index of the\n"
+     "bracket that closes it, or len(texts)}, and whether the line text is all ASCII."},
+    {"LineNameColumns", f_line_name_columns, METH_VARARGS,
+     "LineNameColumns(logical, defines, reads) -> (defines_at, reads_at): the 1-based\n"
+     "(line, col) of each name in the record's tokens, or None (see resolver.LineNames)."},
     {"GetTokenType", f_token_type, METH_O,
      "GetTokenType(text) -> int: the type code of the token that text begins with."},
     {"Tokenize", f_tokenize, METH_O,

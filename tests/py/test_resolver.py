@@ -422,6 +422,88 @@ class LineViewTest(unittest.TestCase):
         self.assertEqual(doc['diagnostics'], [])
 
 
+class TokenTableTest(unittest.TestCase):
+    """The native token tables the resolver reads records through, judged by
+    the records' (text, (row, col)) view."""
+
+    kSources = [
+        b'x = 1\n',
+        b'def f(a, (b, c)=d):  # note\n',
+        b'y = [1,\n     2] + {3: (4)}\n',
+        b'z = f(a)) + (b\n',           # a stray close, an open one left
+        b'w = x \\\n    + 1  # after\n',
+        b'\xc3\xa9 = "\xc3\xa9"\n',
+        b'# only a comment\n',
+        b'',
+    ]
+
+    def Records(self):
+        for source in self.kSources:
+            for logical in analysis.AnalyzeText(source, '2.7', b'p.py').logicals:
+                yield source, logical
+
+    def testTablesFollowTheTokens(self):
+        from pysource import _fastaccess as fa
+        for source, L in self.Records():
+            first = L.fFirstLine + 1
+            texts, rows, cols = fa.GetLogicalTokenTable(L)
+            self.assertEqual(zip(texts, zip(rows, cols)), list(L.fTokens), source)
+            kept = [(t, (first + r, c + 1)) for t, (r, c) in L.fTokens
+                    if t[:1] != b'#' and t != b'\\']
+            texts, lines, cols, comments, match, ascii = fa.GetLogicalLineTable(L)
+            self.assertEqual(zip(texts, zip(lines, cols)), kept, source)
+            self.assertEqual(comments, [(first + r, c + 1, t) for t, (r, c) in L.fTokens
+                                        if t[:1] == b'#'], source)
+            self.assertEqual(ascii, max(L.fLineText or b' ') < b'\x80', source)
+            stack, expected = [], {}
+            for i, t in enumerate(texts):
+                if t in (b'(', b'[', b'{'):
+                    stack.append(i)
+                elif t in (b')', b']', b'}') and stack:
+                    expected[stack.pop()] = i
+            expected.update((i, len(texts)) for i in stack)
+            self.assertEqual(match, expected, source)
+
+    def testNameColumns(self):
+        from pysource import _fastaccess as fa
+        cases = [
+            # source, defines, reads, defines_at, reads_at
+            (b'x = x + a.b\n', [b'x'], [b'x', b'a', b'a.b'], [(1, 1)], [(1, 5), (1, 9), (1, 9)]),
+            (b'a.x = x\n', [b'x'], [b'x'], [(1, 7)], [(1, 7)]),       # not after a dot
+            (b'y = a.b.c + a.b.d\n', [], [b'a.b.d', b'a.b.e'], [], [(1, 13), None]),
+            (b'z = f"{q}" + \'q\'\n', [b'z'], [b'q', b'w'], [(1, 1)], [(1, 5), None]),
+            (b'u = (1,\n     v)  # v\n', [b'u', b'u'], [b'v'], [(1, 1), (1, 1)], [(2, 6)]),
+        ]
+        for source, defines, reads, defines_at, reads_at in cases:
+            L = analysis.AnalyzeText(source, '3.8', b'p.py').logicals[0]
+            self.assertEqual(fa.LineNameColumns(L, defines, reads), (defines_at, reads_at),
+                             source)
+            self.assertEqual(fa.LineNameColumns(L, tuple(defines), iter(reads)),
+                             (defines_at, reads_at), source)
+
+    def testBadArgumentsAndReferences(self):
+        import sys
+        from pysource import _fastaccess as fa
+        for call in (fa.GetLogicalTokenTable, fa.GetLogicalLineTable):
+            for bad in (None, [], b'x = 1'):
+                self.assertRaisesRegexp(TypeError, 'Argument must be a logical', call, bad)
+        L = analysis.AnalyzeText(b'x = f(y)  # c\n', '3.8', b'p.py').logicals[0]
+        for defines, reads, error in [(None, [], 'sequence of bytes'), ([b'x'], [1], 'bytes'),
+                                      ([u'x'], [], 'bytes'), ([], b'y', 'bytes')]:
+            self.assertRaisesRegexp(TypeError, error, fa.LineNameColumns, L, defines, reads)
+        self.assertRaisesRegexp(TypeError, 'Argument must be a logical', fa.LineNameColumns,
+                                None, [], [])
+        texts = fa.GetLogicalTokenTable(L)[0]
+        names = [b'x', b'f.g']
+        for call in (fa.GetLogicalTokenTable, fa.GetLogicalLineTable,
+                     lambda L: fa.LineNameColumns(L, names[:1], names)):
+            call(L)
+            before = [sys.getrefcount(o) for o in texts + names + [L]]
+            for _ in range(100):
+                call(L)
+            self.assertEqual([sys.getrefcount(o) for o in texts + names + [L]], before)
+
+
 # ---- the corpus judges
 
 def CheckDefinitions(test, module):
