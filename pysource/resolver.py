@@ -87,7 +87,12 @@ kBuiltins = {
     '3.6': (_kBuiltins3 - frozenset(['breakpoint'])) | _kModuleDunders,
     '3.7': _kBuiltins3 | _kModuleDunders,
     '3.8': _kBuiltins3 | _kModuleDunders,
+    '3.9': _kBuiltins3 | _kModuleDunders,
 }
+kBuiltins['3.10'] = kBuiltins['3.9'] | frozenset(['EncodingWarning', 'aiter', 'anext'])
+kBuiltins['3.11'] = kBuiltins['3.10'] | frozenset(['BaseExceptionGroup', 'ExceptionGroup'])
+kBuiltins['3.12'] = kBuiltins['3.11']
+kBuiltins['3.13'] = kBuiltins['3.12'] | frozenset(['PythonFinalizationError'])
 # Names a class body has before its first line, and a package's __init__.
 kClassNames = frozenset(['__module__', '__qualname__'])
 kPackageNames = frozenset(['__path__'])
@@ -119,6 +124,7 @@ kParameter, kDef, kClass = 'parameter', 'def', 'class'
 kForTarget, kWithTarget, kExceptTarget = 'for', 'with', 'except'
 kComprehensionTarget, kWalrus = 'comprehension', 'walrus'
 kGlobalDecl, kNonlocalDecl, kDel = 'global', 'nonlocal', 'del'
+kMatchTarget, kTypeParameter, kTypeAlias = 'match', 'type-parameter', 'type-alias'
 
 _kImportKinds = (kImport, kFromImport)
 _kDefinitionKinds = (kImport, kFromImport, kDef, kClass)
@@ -146,9 +152,12 @@ _kTypeComment = re.compile(br'#\s*type:\s*(.*)')
 
 
 class Scope(object):
-    """A scope: kind ('module', 'class', 'function', 'lambda', 'comprehension'),
-    name (CPython's: 'top', the def or class name, 'lambda', 'listcomp', 'setcomp',
-    'dictcomp', 'genexpr'), line and end_line (1-based, inclusive), its first
+    """A scope: kind ('module', 'class', 'function', 'lambda', 'comprehension',
+    'annotation' for the type parameters of a def, class or type alias,
+    'alias' for what is evaluated lazily there: a type alias's value, a type
+    parameter's bound or default), name (CPython's: 'top', the def or class
+    name, 'lambda', 'listcomp', 'setcomp', 'dictcomp', 'genexpr'; the alias or
+    type parameter name), line and end_line (1-based, inclusive), its first
     decorator's line (decorated_line), parent, children, bindings and
     references in source order, and the CPython symbol flags of its names."""
 
@@ -328,6 +337,10 @@ class _Reader(object):
         self.version = version
         self.keywords = keywords
         self.py2 = version == '2.7'
+        numbers = tuple(int(x) for x in version.split('.') if x.isdigit())
+        self.match_statements = numbers >= (3, 10)
+        self.type_parameters = numbers >= (3, 12)
+        self.matches = []           # [indent of an open match statement, of its cases]
         self.stub = stub
         self.future_annotations = False
         self.all_names = []          # (name, line, col) of __all__ entries
@@ -582,10 +595,11 @@ class _Reader(object):
             scope.AddFlag(name, DEF_GLOBAL if declared & DEF_GLOBAL else DEF_NONLOCAL)
             self.Bind(target, name, i, kWalrus)
 
-    def Params(self, a, b, outer, inner, annotations=True):
-        """Parameters in [a, b): names bound in inner, defaults and
-        annotations read in outer."""
+    def Params(self, a, b, outer, inner, annotations=True, annotation_scope=None):
+        """Parameters in [a, b): names bound in inner, defaults read in outer,
+        annotations in annotation_scope (the type parameters' scope) or outer."""
         texts = self.line.texts
+        annotation_scope = annotation_scope or outer
         for position, (s, e) in enumerate(self.Split(a, b, (',',))):
             while s < e and texts[s] in ('*', '**'):
                 s += 1
@@ -605,7 +619,7 @@ class _Reader(object):
             if self.IsName(texts[s]):
                 self.Bind(inner, texts[s], s, kParameter, flag=DEF_PARAM)
             if annotations and s + 1 < eq and texts[s + 1] == ':':
-                self.Expr(s + 2, eq, outer, annotation=True)
+                self.Expr(s + 2, eq, annotation_scope, annotation=True)
 
     # -- targets
 
@@ -670,6 +684,9 @@ class _Reader(object):
             return
         i = 1 if texts[0] == 'async' and n > 1 else 0
         head = texts[i]
+        if self.match_statements and (self.matches or head == 'match') and \
+                self.MatchClause(logical, head, scope):
+            return
         if head == '@':
             self.Expr(1, n, scope)
             return
@@ -694,7 +711,11 @@ class _Reader(object):
                 self.Expr(at + 1, colon, scope)
                 self.Target(i + 1, at, scope, kForTarget, order=colon)
             elif head == 'with':
-                for s, e in self.Split(i + 1, colon, (',',)):
+                a, b = i + 1, colon
+                if texts[a] == '(' and line.match.get(a) == b - 1 and \
+                        self.FindAtDepth0(a + 1, b - 1, ('as',)) < b - 1:
+                    a, b = a + 1, b - 1     # parenthesized items: with (x as y, z):
+                for s, e in self.Split(a, b, (',',)):
                     at = self.FindAtDepth0(s, e, ('as',))
                     self.Expr(s, at, scope)
                     if at < e:
@@ -708,22 +729,151 @@ class _Reader(object):
             if s < e:
                 self.Simple(s, e, body_scope)
 
+    def MatchClause(self, logical, head, scope):
+        """Reads a match statement's header or one of its case clauses; False
+        for other lines (match and case are names elsewhere)."""
+        texts, n = self.line.texts, self.line.n
+        indent = logical.fIndent
+        matches = self.matches
+        while matches and matches[-1][0] >= indent:
+            matches.pop()
+        if head == 'match':
+            # match <subject>: ends its line; match[x]: int and match(x) do not.
+            colon = self.FindAtDepth0(1, n, (':',))
+            if colon != n - 1 or colon < 2 or texts[1] in ('=', '.') or texts[1] in _kAugOps:
+                return False
+            self.Expr(1, colon, scope)
+            matches.append([indent, None])
+            return True
+        if head != 'case' or not matches or matches[-1][1] not in (None, indent) or n < 3:
+            return False
+        matches[-1][1] = indent
+        colon = self.FindAtDepth0(1, n, (':',))
+        guard = self.FindAtDepth0(1, colon, ('if',))
+        self.Pattern(1, guard, scope)
+        if guard < colon:
+            self.Expr(guard + 1, colon, scope)
+        for s, e in self.Split(colon + 1, n, (';',)):
+            if s < e:
+                self.Simple(s, e, scope)
+        return True
+
+    def Pattern(self, a, b, scope):
+        """A case pattern in [a, b): captures, as and star names bind (_ binds
+        nothing); value patterns, class names and mapping keys are read; the
+        keyword names of class patterns are not names."""
+        texts, match = self.line.texts, self.line.match
+        i = a
+        while i < b:
+            t = texts[i]
+            if t in _kOpen:
+                close = min(match[i], b)
+                if t == '{':
+                    for s, e in self.Split(i + 1, close, (',',)):
+                        if s < e and texts[s] == '**':
+                            self.Pattern(s + 1, e, scope)
+                        elif s < e:
+                            key = self.FindAtDepth0(s, e, (':',))
+                            self.Expr(s, key, scope)
+                            self.Pattern(key + 1, e, scope)
+                else:
+                    self.Pattern(i + 1, close, scope)
+                i = close + 1
+                continue
+            if not self.IsName(t):
+                i += 1
+                continue
+            j = i + 1
+            while j + 1 < b and texts[j] == '.':
+                j += 2
+            if j < b and texts[j] == '(':
+                # A class pattern: the class is read, keyword names skipped.
+                self.Use(scope, t, i)
+                close = min(match[j], b)
+                for s, e in self.Split(j + 1, close, (',',)):
+                    if e - s >= 2 and texts[s + 1] == '=' and self.IsName(texts[s]):
+                        s += 2
+                    self.Pattern(s, e, scope)
+                i = close + 1
+                continue
+            if j > i + 1:
+                self.Use(scope, t, i)       # a value pattern: a dotted name
+            elif t != '_':
+                self.Bind(scope, t, i, kMatchTarget)
+            i = j
+
+    def TypeParameters(self, a, b, holder):
+        """A type parameter list in [a, b): the names bind in holder, the
+        bounds and defaults are read lazily in a scope of their own."""
+        texts = self.line.texts
+        for s, e in self.Split(a, b, (',',)):
+            while s < e and texts[s] in ('*', '**'):
+                s += 1
+            if s >= e or not self.IsName(texts[s]):
+                continue
+            self.Bind(holder, texts[s], s, kTypeParameter)
+            k = s + 1
+            while k < e and texts[k] in (':', '='):
+                end = self.FindAtDepth0(k + 1, e, ('=',))
+                line, col = self.line.pos[s]
+                self.Expr(k + 1, end, Scope('alias', texts[s], line, col, holder))
+                k = end
+
+    def AnnotationScope(self, scope, inner, name_at):
+        """The scope of a type parameter list, put between scope and the def
+        or class scope inner (None for a type alias)."""
+        line, col = self.line.pos[name_at]
+        holder = Scope('annotation', self.line.texts[name_at], line, col, None)
+        holder.parent = scope
+        if inner is None:
+            scope.children.append(holder)
+            return holder
+        scope.children[scope.children.index(inner)] = holder
+        holder.line, holder.end_line = inner.line, inner.end_line
+        holder.decorated_line = inner.decorated_line
+        inner.parent = holder
+        holder.children.append(inner)
+        return holder
+
+    def TypeAlias(self, a, b, scope):
+        """type X[T] = value: X binds in scope, T in the alias's type parameter
+        scope, the value is read lazily in a scope of its own."""
+        texts = self.line.texts
+        name_at = a + 1
+        holder = scope
+        eq = a + 2
+        if texts[eq] == '[':
+            close = self.line.match[eq]
+            holder = self.AnnotationScope(scope, None, name_at)
+            self.TypeParameters(eq + 1, close, holder)
+            eq = close + 1
+        line, col = self.line.pos[name_at]
+        self.Expr(eq + 1, b, Scope('alias', texts[name_at], line, col, holder))
+        self.Bind(scope, texts[name_at], name_at, kTypeAlias, order=b)
+
     def Header(self, i, head, scope, inner):
         """A def or class header from token i; returns the index of its colon."""
         texts, n = self.line.texts, self.line.n
         name_at = i + 1
+        after = name_at + 1
+        holder = scope
+        if after < n and texts[after] == '[' and self.type_parameters:
+            holder = self.AnnotationScope(scope, inner, name_at)
+            close = self.line.match[after]
+            self.TypeParameters(after + 1, close, holder)
+            after = close + 1
         if head == 'def':
-            open_ = name_at + 1
+            open_ = after
             close = self.line.match.get(open_, n)
-            self.Params(open_ + 1, close, scope, inner)
+            self.Params(open_ + 1, close, scope, inner, annotation_scope=holder)
             colon = self.FindAtDepth0(close + 1, n, (':',))
             if close + 1 < colon and texts[close + 1] == '->':
-                self.Expr(close + 2, colon, scope, annotation=True)
+                self.Expr(close + 2, colon, holder, annotation=True)
             kind = kDef
         else:
-            colon = self.FindAtDepth0(name_at + 1, n, (':',))
-            if name_at + 1 < colon and texts[name_at + 1] == '(':
-                self.Args(name_at + 2, self.line.match[name_at + 1], scope)
+            colon = self.FindAtDepth0(after, n, (':',))
+            if after < colon and texts[after] == '(':
+                self.Args(after + 1, self.line.match[after], holder)
             kind = kClass
         b = self.Bind(scope, texts[name_at], name_at, kind, order=colon)
         inner.binding = b
@@ -770,6 +920,10 @@ class _Reader(object):
                 bd.qualified = module + (b'' if module.endswith(b'.') else b'.') + texts[s2]
                 bd.aliased = texts[kw] != texts[s2]
                 bd.statement = self.line.pos[a]
+            return
+        if head == 'type' and self.type_parameters and b - a >= 4 and \
+                texts[a + 2] in ('=', '[') and self.IsName(texts[a + 1]):
+            self.TypeAlias(a, b, scope)
             return
         if head in ('global', 'nonlocal'):
             kind = kGlobalDecl if head == 'global' else kNonlocalDecl
@@ -970,6 +1124,9 @@ class Module(object):
         scope = self.module
         while True:
             for child in scope.children:
+                if child.kind == 'annotation' and child.children and \
+                        child.children[0].kind in ('function', 'class'):
+                    child = child.children[0]       # a def or class's type parameters
                 if child.kind in ('function', 'class') and \
                         child.decorated_line <= line <= child.end_line:
                     scope = child
@@ -1078,7 +1235,7 @@ class Module(object):
             else:
                 candidates, orders, live, live_orders = scope.Candidates(name)
             if candidates:
-                if deferred or scope.kind in ('lambda', 'comprehension'):
+                if deferred or scope.kind in ('lambda', 'comprehension', 'annotation', 'alias'):
                     if deferred and candidates[-1].kind == kDel and not candidates[-1].clauses \
                             and scope.kind == 'module':
                         # Deleted at the top level: gone once the module has run.
@@ -1138,7 +1295,7 @@ class Module(object):
                 # The implicit cell of the class a function is defined in.
                 r.resolution = kBuiltin
                 return
-            if scope.kind in ('function', 'lambda'):
+            if scope.kind in ('function', 'lambda', 'alias'):
                 deferred = True
             first = False
             scope = scope.parent
