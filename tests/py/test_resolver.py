@@ -90,7 +90,18 @@ def SymtableOracle(version, items):
 
 
 kOracleKinds = {'module': 'module', 'class': 'class', 'function': 'function',
-                'lambda': 'function', 'comprehension': 'function'}
+                'lambda': 'function', 'comprehension': 'function',
+                'annotation': 'type parameters', 'alias': 'type alias'}
+# From 3.12 symtable calls a bound's or default's scope a type variable's; ours
+# are all lazily read scopes. Its hidden names (.type_params, .generic_base,
+# .defaults, __type_params__, __classdict__) are the compiler's machinery, not
+# names of the source, and are left out.
+kTheirKinds = {'type variable': 'type alias'}
+kHiddenNames = re.compile(r'^(\..*|__type_params__|__classdict__)$')
+
+
+def Numbers(version):
+    return tuple(int(x) for x in version.split('.'))
 
 
 def OurScopes(module, version):
@@ -106,7 +117,7 @@ def OurScopes(module, version):
         # too; before 3.8 a decorated def or class starts at its first decorator.
         if scope.kind == 'module' or version == '2.7' and scope.kind == 'comprehension':
             line = 0
-        elif version == '3.8':
+        elif Numbers(version) >= (3, 8):
             line = scope.line
         else:
             line = scope.decorated_line
@@ -124,6 +135,10 @@ def TheirScopes(table, version):
         if version == '2.7':
             # 2.7 keeps a list comprehension's result in a hidden local "_[1]".
             summary = dict((k, [n for n in v if not n.startswith('_[')])
+                           for k, v in summary.items())
+        if Numbers(version) >= (3, 12):
+            kind = kTheirKinds.get(kind, kind)
+            summary = dict((k, [n for n in v if not kHiddenNames.match(n)])
                            for k, v in summary.items())
         theirs[(kind, name.encode('utf-8'), line, json.dumps(summary, sort_keys=True))] += 1
     return theirs
@@ -190,6 +205,15 @@ kScopeCases = [
      b'@dec(a)\ndef f(x: T = d, *, y: U = e) -> R:\n    pass\n'),
     ('NFKC-normalized names',
      u'def f():\n    \U0001d518nicode = 1\n    \xb5 = 2\n    return \u03bc\n'.encode('utf-8')),
+    ('type parameters: bounds, defaults and bases in their scopes, free in bodies', '3.13',
+     b'class Box[T: int, *Ts, **P](Base[T]):\n    def get(self, f: P) -> T: return f(T)\n'
+     b'def first[T = str](items: list[T], d=z) -> T:\n    return items[0], T\n'),
+    ('type aliases', '3.13', b'type Alias[K] = dict[K, V]\ntype B = int\n'
+     b'def f():\n    type L = list[L]\n    return L\n'),
+    ('match statements bind captures, not _ or class keywords', '3.13',
+     b'def f(cmd):\n    match cmd:\n        case {"a": act, **rest} if act:\n            pass\n'
+     b'        case Point(x=0, y=yy) | [yy, *_]:\n            pass\n'
+     b'        case mod.K() as s: pass\n    match = case = 1\n'),
     ('Python 2: tuple parameters, list comprehensions, empty slice steps', '2.7',
      b'def f(a, (b, (c, d)), (e)):\n    [x for x in a]\n    y = a[1:2:]\n    print x, None\n'
      b'lambda (p, q): p\n'),
@@ -257,6 +281,37 @@ kResolutionCases = [
      (3, 5), 'binding', 1),
     ('f-string fields', '3.8', b'n = 1\ns = f"{n:>{n}}"\n', (2, 8), 'binding', 1),
     ('one-line def body', '3.8', b'def f(a): return a\n', (1, 18), 'binding', 1),
+    ('type parameter in a def body', '3.13', b'def f[T](x: T):\n    return T\n', (2, 12),
+     'binding', 1),
+    ('class type parameter in a method', '3.13', b'class C[T]:\n    def m(self) -> T: return T\n',
+     (2, 30), 'binding', 1),
+    ('defaults are read outside the type parameters', '3.13', b'def f[T](x=T): pass\n', (1, 12),
+     'undefined', None),
+    ('a type parameter list is not before 3.12', '3.11', b'T = 1\nprint(T)\n', (2, 7),
+     'binding', 1),
+    ('an alias value reads later names', '3.13', b'type A = B\nB = int\n', (1, 10), 'binding', 2),
+    ('an alias binds its name', '3.13', b'type A[K] = K\nprint(A)\n', (2, 7), 'binding', 1),
+    ('a capture binds', '3.13', b'match p:\n    case [x]: print(x)\n', (2, 21), 'binding', 2),
+    ('a value pattern is read', '3.13', b'import m\nmatch p:\n    case m.K: pass\n', (3, 10),
+     'binding', 1),
+    ('a guard reads the capture', '3.13', b'match p:\n    case {"k": v} if v:\n        pass\n',
+     (2, 22), 'binding', 2),
+    ('match and case are names elsewhere', '3.13', b'match = 1\nmatch(case)\n', (2, 1),
+     'binding', 1),
+    ('except* binds', '3.13', b'try: pass\nexcept* E as g: print(g)\n', (2, 23), 'binding', 2),
+    ('parenthesized with-items', '3.13', b'with (open(a) as f, open(b) as g): print(f, g)\n',
+     (1, 45), 'binding', 1),
+    ('relaxed decorators', '3.13', b'b = []\n@b[0].connect\ndef f(): pass\n', (2, 2),
+     'binding', 1),
+    ('starred for iterables', '3.13', b'a = ()\nfor x in *a, *a: print(x)\n', (2, 11),
+     'binding', 1),
+    ('walrus in a subscript and a set', '3.13', b'a[y := 1], {z := 2}\nprint(y, z)\n', (2, 10),
+     'binding', 1),
+    ('aiter is a 3.10 builtin', '3.10', b'aiter(x)\n', (1, 1), 'builtin', None),
+    ('but not a 3.9 one', '3.9', b'aiter(x)\n', (1, 1), 'undefined', None),
+    ('ExceptionGroup is a 3.11 builtin', '3.11', b'ExceptionGroup\n', (1, 1), 'builtin', None),
+    ('PythonFinalizationError is a 3.13 builtin', '3.13', b'PythonFinalizationError\n',
+     (1, 1), 'builtin', None),
 ]
 
 
@@ -360,6 +415,14 @@ kDiagnosticCases = [
      [(3, 1, 'F401')]),
     ('Python 2 builtins and print statement', '2.7', None,
      b'print unicode(xrange(3)), nope\n', [(1, 27, 'F821')]),
+    ('type parameters, aliases, match statements, except*', '3.13', None,
+     b'from typing import Callable\ndef first[T](items: list[T]) -> T:\n    return items[0]\n'
+     b'class Box[T: int, *Ts, **P]:\n    def get(self, f: Callable[P, T]) -> T:\n'
+     b'        return f()\ntype Alias[K] = dict[K, int]\ndef handle(command):\n'
+     b'    match command:\n        case {"action": act, **rest}:\n            return act, rest\n'
+     b'        case Point(x=0, y=yy) | [yy, *_]:\n            return yy\n'
+     b'        case str() as s if s:\n            return s\n    try:\n        pass\n'
+     b'    except* ValueError as eg:\n        return eg\n', [(12, 14, 'F821')]),
     ('syntax errors contribute nothing', '3.8', None,
      b'import os\ndef f(:\n    pass\nprint(y)\n', [(1, 1, 'F401'), (4, 7, 'F821')]),
 ]
