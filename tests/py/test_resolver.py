@@ -1,7 +1,7 @@
 """The resolver: scopes, bindings, references and diagnostics across lines.
 
-CPython's symtable judges the scopes (Python 3.8's through its interpreter,
-2.7's in this process); the Debian pyflakes3 (Python 3.11) is the peer for
+CPython's symtable judges the scopes (Python 3.8's and, for type parameters
+and match statements, 3.13's through their interpreters, 2.7's in this process); the Debian pyflakes3 (Python 3.11) is the peer for
 undefined names and unused imports.
 """
 
@@ -93,11 +93,14 @@ kOracleKinds = {'module': 'module', 'class': 'class', 'function': 'function',
                 'lambda': 'function', 'comprehension': 'function',
                 'annotation': 'type parameters', 'alias': 'type alias'}
 # From 3.12 symtable calls a bound's or default's scope a type variable's; ours
-# are all lazily read scopes. Its hidden names (.type_params, .generic_base,
-# .defaults, __type_params__, __classdict__) are the compiler's machinery, not
-# names of the source, and are left out.
+# are all lazily read scopes. Its hidden names of type parameter scopes are the
+# compiler's machinery, not names of the source, and are left out. 3.12 inlines
+# list, set and dict comprehensions into their parent's symbols, which the
+# resolver does not model: the 3.13 cases hold none, and the standard library
+# of 3.12 and later is not judged.
 kTheirKinds = {'type variable': 'type alias'}
-kHiddenNames = re.compile(r'^(\..*|__type_params__|__classdict__)$')
+kHiddenNames = re.compile(r'^(\.type_params|\.generic_base|\.defaults|\.kwdefaults|'
+                          r'__type_params__|__classdict__)$')
 
 
 def Numbers(version):
