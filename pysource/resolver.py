@@ -758,6 +758,13 @@ class _Reader(object):
                 self.Simple(s, e, scope)
         return True
 
+    def IsCase(self, indent):
+        """Whether a case line at indent is a clause of an open match statement."""
+        for match_indent, case_indent in reversed(self.matches):
+            if match_indent < indent:
+                return case_indent in (None, indent)
+        return False
+
     def Pattern(self, a, b, scope):
         """A case pattern in [a, b): captures, as and star names bind (_ binds
         nothing); value patterns, class names and mapping keys are read; the
@@ -1662,7 +1669,10 @@ def Resolve(result, stub=None):
                                          for i in range(1, logical.fTokenCount)
                                          if logical.GetTokenString(i)[:1] != '#')
                                 .split(b'(')[0])
-        reader.clauses = clauses.Enter(logical, first_text)
+        head = first_text
+        if head == 'case' and reader.matches and reader.IsCase(logical.fIndent):
+            head = 'if'     # each case's body runs or not, like an if's
+        reader.clauses = clauses.Enter(logical, head)
         if error is None:
             try:
                 reader.Record(logical, scope, record_scope)

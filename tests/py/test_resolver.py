@@ -426,6 +426,8 @@ kDiagnosticCases = [
      b'        case Point(x=0, y=yy) | [yy, *_]:\n            return yy\n'
      b'        case str() as s if s:\n            return s\n    try:\n        pass\n'
      b'    except* ValueError as eg:\n        return eg\n', [(12, 14, 'F821')]),
+    ('a del in a case body is conditional', '3.13', None,
+     b'x = 1\nmatch x:\n    case 1:\n        del x\n    case _:\n        pass\nprint(x)\n', []),
     ('syntax errors contribute nothing', '3.8', None,
      b'import os\ndef f(:\n    pass\nprint(y)\n', [(1, 1, 'F401'), (4, 7, 'F821')]),
 ]
