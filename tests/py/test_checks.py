@@ -172,7 +172,8 @@ kNewSyntax = [
     'match(x)', 'match = case = _ = 1', 'case.x, match[1:2]', 'print(match, case)',
     'def f[T](x: T) -> T: pass', 'class C[T: int, *Ts, **P](B): pass', 'type X[T] = list[T]', 'type = 1',
     'def f[T, T](): pass', 'class C[T, *T]: pass', 'type X[T, T] = int', 'def f[T = int](): pass',
-    'def f[T=int, U](): pass', 'def f[*Ts = *tuple[int]](): pass']
+    'def f[T=int, U](): pass', 'def f[*Ts = *tuple[int]](): pass',
+    'async def f():\n    return [[i async for i in a] for j in b]', 'x = [[i async for i in a] for j in b]']
 kOwnMessages = ('multiple assignments to name', 'makes remaining patterns unreachable', 'alternative patterns',
                 'multiple starred names', 'attribute name repeated', 'positional patterns follow',
                 "cannot use '_' as a target", 'number required in complex literal', 'mapping pattern checks',

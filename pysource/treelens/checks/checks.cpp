@@ -1407,7 +1407,8 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
   }
   // A comprehension that awaits or iterates asynchronously must be directly in
   // an async def or in a comprehension that is asynchronous itself (not in a
-  // module or class body), but for a generator expression from 3.7 on.
+  // module or class body), but for a generator expression from 3.7 on; from
+  // 3.11 on, in an async def through any comprehensions.
   const char *OutsideAsync = "asynchronous comprehension outside of an asynchronous function";
   if (!(Async || Awaits))
     for (N *Inside : AsyncInside)
@@ -1415,6 +1416,11 @@ void Checker::comprehension(N *Elt, N *For, const Scope &S, N *At, bool Dict) {
   bool GenExp = NewScope && !List && (symOf(At) != Sym::Atom || textIs(child(At, 0), "("));
   if ((Async || Awaits) && Py3 && !(GenExp && Minor >= 7)) {
     const Scope *F = function(S);
+    // From 3.11 on the comprehensions around it become asynchronous
+    // themselves: what counts is the function around them.
+    if (Minor >= 11)
+      while (F && F->B == Block::Comprehension)
+        F = F->Outer ? function(*F->Outer) : nullptr;
     if (F && F->B == Block::Comprehension && F->AsyncInside)
       F->AsyncInside->push_back(At);
     else if (!F || F->B != Block::AsyncFunction) // a module or class body too
