@@ -1995,19 +1995,6 @@ bool Checker::fstring(N *Tok, N *At, const Scope &S) {
   return !Scan.Failed;
 }
 
-/// The token index of a ParseError pending (cleared).
-Py_ssize_t takeParseErrorContext() {
-  PyObject *Type, *Value, *Tb;
-  PyErr_Fetch(&Type, &Value, &Tb);
-  PyErr_NormalizeException(&Type, &Value, &Tb);
-  Ref HoldType = Ref::steal(Type), HoldValue = Ref::steal(Value), HoldTb = Ref::steal(Tb);
-  Ref Context = tl::require(PyObject_GetAttrString(Value ? Value : Py_None, "context"));
-  Py_ssize_t TokI = PyNumber_AsSsize_t(Context.get(), PyExc_OverflowError);
-  if (TokI == -1 && PyErr_Occurred())
-    throw tl::PyErrSet();
-  return TokI;
-}
-
 /// An assignment, annotation or statement separator outside brackets: the
 /// expression's text closed the parenthesis around it early.
 bool isStatementOperatorText(const char *T) {
@@ -2085,7 +2072,7 @@ void Checker::fieldExpression(N *Tok, Py_ssize_t Begin, Py_ssize_t End, const Sc
   });
   if (!Ok) {
     if (PyErr_ExceptionMatches(host::Host.ParseError)) {
-      Py_ssize_t At = takeParseErrorContext();
+      Py_ssize_t At = host::takeParseErrorContext();
       // The closing parenthesis is the last token: CPython's tokenizer has
       // then read to the end, and calls the error an unexpected end.
       bool AtEnd = At >= Count - 1;

@@ -143,19 +143,6 @@ void errorPosition(LogicalLineObject *L, Py_ssize_t TokI, long &Line, long &Colu
   throw tl::PyErrSet();
 }
 
-/// The token index of a ParseError pending (cleared).
-Py_ssize_t parseErrorContext() {
-  PyObject *Type, *Value, *Tb;
-  PyErr_Fetch(&Type, &Value, &Tb);
-  PyErr_NormalizeException(&Type, &Value, &Tb);
-  Ref HoldType = Ref::steal(Type), HoldValue = Ref::steal(Value), HoldTb = Ref::steal(Tb);
-  Ref Context = tl::require(PyObject_GetAttrString(Value ? Value : Py_None, "context"));
-  Py_ssize_t TokI = PyNumber_AsSsize_t(Context.get(), PyExc_OverflowError);
-  if (TokI == -1 && PyErr_Occurred())
-    throw tl::PyErrSet();
-  return TokI;
-}
-
 bool textIs(PyObject *T, const char *Word) {
   Py_ssize_t N = static_cast<Py_ssize_t>(std::strlen(Word));
   return PyString_GET_SIZE(T) == N && std::memcmp(PyString_AS_STRING(T), Word, N) == 0;
@@ -327,7 +314,7 @@ void inspectSingleFStringToken(AnalyzerObject *A, PyObject *Logical, Py_ssize_t 
     }
     if (!Ok) {
       if (PyErr_ExceptionMatches(Host.ParseError))
-        raiseLocated(Logical, TokenI, Text, It.Pos, Sub, parseErrorContext());
+        raiseLocated(Logical, TokenI, Text, It.Pos, Sub, host::takeParseErrorContext());
       throw tl::PyErrSet();
     }
     copyFindings(Logical, Sub, TokenI);

@@ -159,5 +159,17 @@ void bindHost(PyObject *Module) {
   Host.TimeTime = take(Time.get(), "time");
 }
 
+Py_ssize_t takeParseErrorContext() {
+  PyObject *Type, *Value, *Tb;
+  PyErr_Fetch(&Type, &Value, &Tb);
+  PyErr_NormalizeException(&Type, &Value, &Tb);
+  Ref HoldType = Ref::steal(Type), HoldValue = Ref::steal(Value), HoldTb = Ref::steal(Tb);
+  Ref Context = tl::require(PyObject_GetAttrString(Value ? Value : Py_None, "context"));
+  Py_ssize_t TokI = PyNumber_AsSsize_t(Context.get(), PyExc_OverflowError);
+  if (TokI == -1 && PyErr_Occurred())
+    throw tl::PyErrSet();
+  return TokI;
+}
+
 } // namespace host
 } // namespace treelens

@@ -81,6 +81,10 @@ TL_HIDDEN extern Bindings Host;
 /// in the documented order. Throws PyErrSet (an ImportError for anything missing).
 TL_HIDDEN void bindHost(PyObject *Module);
 
+/// The token index (the `context`) of the pending optpgen ParseError, which
+/// it clears. Throws PyErrSet when the context is not an index.
+TL_HIDDEN Py_ssize_t takeParseErrorContext();
+
 /// The symbol-info constant Name (borrowed).
 inline PyObject *sym(Sym Name) { return Host.SymValues[static_cast<int>(Name)]; }
 
